@@ -1,0 +1,43 @@
+// The daemon's queues on Asio: the main queue is an io_context run by the main thread,
+// the background queue is a thread pool, serial queues are strands on that pool, and
+// blocking work gets a pool of its own. Thread-safe.
+#pragma once
+
+#include <memory>
+#include <string>
+
+#include "core/TaskRunner.h"
+
+namespace asio {
+class io_context;
+class thread_pool;
+}  // namespace asio
+
+namespace qax {
+
+class AsioDispatcher : public Dispatcher, public std::enable_shared_from_this<AsioDispatcher> {
+public:
+    explicit AsioDispatcher(unsigned backgroundThreads = 4, unsigned blockingThreads = 16);
+    ~AsioDispatcher() override;
+
+    std::shared_ptr<TaskRunner> mainQueue() override { return main_; }
+    std::shared_ptr<TaskRunner> backgroundQueue() override { return background_; }
+    std::shared_ptr<TaskRunner> makeSerialQueue(std::string name) override;
+    std::shared_ptr<TaskRunner> blockingQueue() override { return blocking_; }
+
+    asio::io_context& mainContext();
+    // Runs the main queue on the calling thread until stopMainLoop().
+    void runMainLoop();
+    void stopMainLoop();
+    // Stops accepting work and joins the pools.
+    void shutdown();
+
+private:
+    struct State;
+    std::unique_ptr<State> state_;
+    std::shared_ptr<TaskRunner> main_;
+    std::shared_ptr<TaskRunner> background_;
+    std::shared_ptr<TaskRunner> blocking_;
+};
+
+}  // namespace qax

@@ -1,0 +1,248 @@
+#include "core/Log.h"
+
+#include <sys/time.h>
+
+#include <cctype>
+#include <cinttypes>
+#include <cstdio>
+#include <cstdlib>
+#include <ctime>
+#include <iostream>
+
+namespace qax {
+
+const char* logLevelName(LogLevel level) {
+    switch (level) {
+        case LogLevel::Default:
+            return "default";
+        case LogLevel::Debug:
+            return "debug";
+        case LogLevel::Error:
+            return "error";
+    }
+    return "default";
+}
+
+namespace {
+
+std::string argText(const LogArg& arg) {
+    return std::visit(
+        [](const auto& v) -> std::string {
+            using T = std::decay_t<decltype(v)>;
+            if constexpr (std::is_same_v<T, LogArg::None>) {
+                return "(null)";
+            } else if constexpr (std::is_same_v<T, std::string>) {
+                return v;
+            } else if constexpr (std::is_same_v<T, double>) {
+                char buf[64];
+                std::snprintf(buf, sizeof buf, "%g", v);
+                return buf;
+            } else {
+                return std::to_string(v);
+            }
+        },
+        arg.v);
+}
+
+std::string argInteger(const LogArg& arg, bool isUnsigned) {
+    if (auto* i = std::get_if<std::int64_t>(&arg.v)) {
+        return isUnsigned ? std::to_string(static_cast<std::uint64_t>(*i)) : std::to_string(*i);
+    }
+    if (auto* u = std::get_if<std::uint64_t>(&arg.v)) {
+        return isUnsigned ? std::to_string(*u) : std::to_string(static_cast<std::int64_t>(*u));
+    }
+    if (auto* d = std::get_if<double>(&arg.v)) {
+        return std::to_string(static_cast<std::int64_t>(*d));
+    }
+    return argText(arg);
+}
+
+std::string argDouble(const LogArg& arg, int precision) {
+    double d = 0;
+    if (auto* p = std::get_if<double>(&arg.v)) {
+        d = *p;
+    } else if (auto* i = std::get_if<std::int64_t>(&arg.v)) {
+        d = static_cast<double>(*i);
+    } else if (auto* u = std::get_if<std::uint64_t>(&arg.v)) {
+        d = static_cast<double>(*u);
+    } else {
+        return argText(arg);
+    }
+    char buf[64];
+    std::snprintf(buf, sizeof buf, "%.*f", precision, d);
+    return buf;
+}
+
+}  // namespace
+
+std::string formatLogMessage(std::string_view format, const std::vector<LogArg>& args,
+                             bool showPrivate) {
+    std::string out;
+    out.reserve(format.size() + 32);
+    std::size_t next = 0;
+    auto take = [&]() -> const LogArg* { return next < args.size() ? &args[next++] : nullptr; };
+    static const LogArg kMissing{};
+    for (std::size_t i = 0; i < format.size(); ++i) {
+        char c = format[i];
+        if (c != '%' || i + 1 == format.size()) {
+            out += c;
+            continue;
+        }
+        std::size_t j = i + 1;
+        if (format[j] == '%') {
+            out += '%';
+            i = j;
+            continue;
+        }
+        bool isPrivate = false;
+        if (format[j] == '{') {
+            auto close = format.find('}', j);
+            if (close == std::string_view::npos) {
+                out += c;
+                continue;
+            }
+            isPrivate = format.substr(j + 1, close - j - 1) == "private";
+            j = close + 1;
+        }
+        // Precision (".02"), then length modifiers, then the conversion.
+        int precision = 6;
+        if (j < format.size() && format[j] == '.') {
+            std::size_t k = j + 1;
+            int p = 0;
+            while (k < format.size() && std::isdigit(static_cast<unsigned char>(format[k]))) {
+                p = p * 10 + (format[k] - '0');
+                ++k;
+            }
+            precision = p;
+            j = k;
+        }
+        while (j < format.size() && (format[j] == 'l' || format[j] == 'h' || format[j] == 'z' ||
+                                     format[j] == 'q')) {
+            ++j;
+        }
+        if (j >= format.size()) {
+            out.append(format.substr(i));
+            break;
+        }
+        const LogArg* arg = take();
+        if (!arg) {
+            arg = &kMissing;
+        }
+        std::string text;
+        switch (format[j]) {
+            case '@':
+            case 's':
+                text = argText(*arg);
+                break;
+            case 'd':
+            case 'i':
+                text = argInteger(*arg, false);
+                break;
+            case 'u':
+                text = argInteger(*arg, true);
+                break;
+            case 'f':
+            case 'g':
+                text = argDouble(*arg, precision);
+                break;
+            default:
+                text = argText(*arg);
+                break;
+        }
+        out += (isPrivate && !showPrivate) ? "<private>" : text;
+        i = j;
+    }
+    return out;
+}
+
+Log::Log(std::string subsystem, std::string category, std::shared_ptr<LogSink> sink)
+    : subsystem_(std::move(subsystem)), category_(std::move(category)), sink_(std::move(sink)) {}
+
+std::shared_ptr<LogSink> Log::sink() const {
+    std::lock_guard lock(mutex_);
+    return sink_;
+}
+
+void Log::setSink(std::shared_ptr<LogSink> sink) {
+    std::lock_guard lock(mutex_);
+    sink_ = std::move(sink);
+}
+
+Log& qaxLog() {
+    // Function-local static: created once, safely under concurrent first use.
+    static Log log(kLogSubsystem, kLogCategory, std::make_shared<StderrLogSink>());
+    return log;
+}
+
+StderrLogSink::StderrLogSink() {
+    const char* level = std::getenv("QAX_LOG_LEVEL");
+    debug_ = level && std::string_view(level) == "debug";
+    const char* priv = std::getenv("QAX_LOG_PRIVATE");
+    private_ = priv && std::string_view(priv) == "1";
+}
+
+void StderrLogSink::write(LogLevel level, std::string_view subsystem, std::string_view category,
+                          std::string_view message) {
+    timeval tv{};
+    gettimeofday(&tv, nullptr);
+    std::tm tm{};
+    localtime_r(&tv.tv_sec, &tm);
+    char stamp[64];
+    std::snprintf(stamp, sizeof stamp, "%04d-%02d-%02d %02d:%02d:%02d.%03ld", tm.tm_year + 1900,
+                  tm.tm_mon + 1, tm.tm_mday, tm.tm_hour, tm.tm_min, tm.tm_sec,
+                  static_cast<long>(tv.tv_usec / 1000));
+    std::string line;
+    line.reserve(message.size() + 80);
+    line.append(stamp).append(" ").append(logLevelName(level)).append(" ");
+    line.append(subsystem).append(":").append(category).append(" ").append(message);
+    line += '\n';
+    std::lock_guard lock(mutex_);
+    std::fwrite(line.data(), 1, line.size(), stderr);
+    std::fflush(stderr);
+}
+
+void CapturingLogSink::write(LogLevel level, std::string_view, std::string_view,
+                             std::string_view message) {
+    std::lock_guard lock(mutex_);
+    entries_.push_back({level, std::string(message)});
+}
+
+std::vector<CapturingLogSink::Entry> CapturingLogSink::entries() const {
+    std::lock_guard lock(mutex_);
+    return entries_;
+}
+
+std::vector<std::string> CapturingLogSink::messages() const {
+    std::lock_guard lock(mutex_);
+    std::vector<std::string> out;
+    out.reserve(entries_.size());
+    for (const auto& e : entries_) {
+        out.push_back(e.message);
+    }
+    return out;
+}
+
+int CapturingLogSink::count(std::string_view text) const {
+    std::lock_guard lock(mutex_);
+    int n = 0;
+    for (const auto& e : entries_) {
+        n += e.message == text;
+    }
+    return n;
+}
+
+int CapturingLogSink::countContaining(std::string_view fragment) const {
+    std::lock_guard lock(mutex_);
+    int n = 0;
+    for (const auto& e : entries_) {
+        n += e.message.find(fragment) != std::string::npos;
+    }
+    return n;
+}
+
+void CapturingLogSink::clear() {
+    std::lock_guard lock(mutex_);
+    entries_.clear();
+}
+
+}  // namespace qax

@@ -1,0 +1,376 @@
+#include "core/PlistCodec.h"
+
+#include <plist/plist.h>
+
+#include <cmath>
+#include <cstdlib>
+#include <cstring>
+#include <limits>
+#include <memory>
+#include <vector>
+
+namespace qax {
+namespace {
+
+struct PlistDeleter {
+    void operator()(plist_t p) const { plist_free(p); }
+};
+using PlistPtr = std::unique_ptr<void, PlistDeleter>;
+
+void setError(std::string* error, std::string text) {
+    if (error) {
+        *error = std::move(text);
+    }
+}
+
+// Element depth of an XML document: every opening tag that is not self-closing counts.
+// The root <plist> element and the leaf element add two to the value depth.
+bool xmlDepthIsSafe(std::string_view s, std::string* error) {
+    int depth = 0;
+    const int limit = kMaxValueDepth + 2;
+    std::size_t i = 0;
+    while ((i = s.find('<', i)) != std::string_view::npos) {
+        if (s.substr(i, 4) == "<!--") {
+            auto end = s.find("-->", i + 4);
+            if (end == std::string_view::npos) {
+                setError(error, "unterminated comment");
+                return false;
+            }
+            i = end + 3;
+            continue;
+        }
+        if (s.substr(i, 9) == "<![CDATA[") {
+            auto end = s.find("]]>", i + 9);
+            if (end == std::string_view::npos) {
+                setError(error, "unterminated CDATA section");
+                return false;
+            }
+            i = end + 3;
+            continue;
+        }
+        auto close = s.find('>', i + 1);
+        if (close == std::string_view::npos) {
+            setError(error, "unterminated tag");
+            return false;
+        }
+        std::string_view tag = s.substr(i + 1, close - i - 1);
+        i = close + 1;
+        if (tag.empty() || tag[0] == '?' || tag[0] == '!') {
+            continue;
+        }
+        if (tag[0] == '/') {
+            --depth;
+        } else if (tag.back() != '/') {
+            if (++depth > limit) {
+                setError(error, "document nested deeper than " + std::to_string(kMaxValueDepth) +
+                                    " levels");
+                return false;
+            }
+        }
+    }
+    return true;
+}
+
+std::uint64_t readBigEndian(const unsigned char* p, std::size_t n) {
+    std::uint64_t v = 0;
+    for (std::size_t k = 0; k < n; ++k) {
+        v = (v << 8) | p[k];
+    }
+    return v;
+}
+
+// Walks the object graph of a binary property list from its top object, checking every
+// offset and reference, and refusing deep nesting (which also catches reference cycles)
+// and graphs that expand to too many nodes through shared references.
+bool binaryStructureIsSafe(std::string_view s, std::string* error) {
+    const auto* data = reinterpret_cast<const unsigned char*>(s.data());
+    const std::size_t size = s.size();
+    if (size < 8 + 32) {
+        setError(error, "binary property list too short");
+        return false;
+    }
+    const unsigned char* trailer = data + size - 32;
+    const std::size_t offsetSize = trailer[6];
+    const std::size_t refSize = trailer[7];
+    const std::uint64_t numObjects = readBigEndian(trailer + 8, 8);
+    const std::uint64_t topObject = readBigEndian(trailer + 16, 8);
+    const std::uint64_t tableOffset = readBigEndian(trailer + 24, 8);
+    if (offsetSize < 1 || offsetSize > 8 || refSize < 1 || refSize > 8 || numObjects == 0 ||
+        topObject >= numObjects || tableOffset < 8 || tableOffset >= size - 32 ||
+        numObjects > (size - 32 - tableOffset) / offsetSize) {
+        setError(error, "malformed binary property list trailer");
+        return false;
+    }
+    auto objectOffset = [&](std::uint64_t index, std::uint64_t& out) {
+        out = readBigEndian(data + tableOffset + index * offsetSize, offsetSize);
+        return out >= 8 && out < tableOffset;
+    };
+    constexpr std::size_t kMaxVisits = 1'000'000;
+    std::size_t visits = 0;
+    struct Item {
+        std::uint64_t index;
+        int depth;
+    };
+    std::vector<Item> stack{{topObject, 1}};
+    while (!stack.empty()) {
+        Item item = stack.back();
+        stack.pop_back();
+        if (++visits > kMaxVisits) {
+            setError(error, "binary property list expands to too many objects");
+            return false;
+        }
+        if (item.depth > kMaxValueDepth + 1) {
+            setError(error, "document nested deeper than " + std::to_string(kMaxValueDepth) +
+                                " levels");
+            return false;
+        }
+        std::uint64_t off = 0;
+        if (!objectOffset(item.index, off)) {
+            setError(error, "binary property list object offset out of range");
+            return false;
+        }
+        const unsigned marker = data[off];
+        const unsigned type = marker >> 4;
+        if (type != 0xA && type != 0xC && type != 0xD) {
+            continue;  // not a container
+        }
+        std::uint64_t count = marker & 0xF;
+        std::uint64_t pos = off + 1;
+        if (count == 0xF) {
+            if (pos >= tableOffset || (data[pos] >> 4) != 0x1) {
+                setError(error, "malformed container length");
+                return false;
+            }
+            const std::size_t n = std::size_t{1} << (data[pos] & 0xF);
+            if (n > 8 || pos + 1 + n > tableOffset) {
+                setError(error, "malformed container length");
+                return false;
+            }
+            count = readBigEndian(data + pos + 1, n);
+            pos += 1 + n;
+        }
+        const std::uint64_t refs = type == 0xD ? count * 2 : count;
+        if (count > tableOffset || refs > (tableOffset - pos) / refSize) {
+            setError(error, "container extends past the object table");
+            return false;
+        }
+        for (std::uint64_t k = 0; k < refs; ++k) {
+            std::uint64_t ref = readBigEndian(data + pos + k * refSize, refSize);
+            if (ref >= numObjects) {
+                setError(error, "object reference out of range");
+                return false;
+            }
+            stack.push_back({ref, item.depth + 1});
+        }
+    }
+    return true;
+}
+
+std::optional<Value> fromPlist(plist_t node) {
+    switch (plist_get_node_type(node)) {
+        case PLIST_BOOLEAN: {
+            uint8_t b = 0;
+            plist_get_bool_val(node, &b);
+            return Value(b != 0);
+        }
+        case PLIST_UINT: {
+            uint64_t u = 0;
+            plist_get_uint_val(node, &u);
+            return Value(static_cast<long long>(u));
+        }
+        case PLIST_UID: {
+            uint64_t u = 0;
+            plist_get_uid_val(node, &u);
+            return Value(static_cast<unsigned long long>(u));
+        }
+        case PLIST_REAL: {
+            double d = 0;
+            plist_get_real_val(node, &d);
+            return Value(d);
+        }
+        case PLIST_STRING:
+        case PLIST_KEY: {
+            uint64_t len = 0;
+            const char* p = plist_get_string_ptr(node, &len);
+            return Value(std::string(p ? p : "", p ? len : 0));
+        }
+        case PLIST_DATE: {
+            int32_t sec = 0, usec = 0;
+            plist_get_date_val(node, &sec, &usec);
+            return Value(Date(kSecondsFrom1970To2001 + sec + usec / 1e6));
+        }
+        case PLIST_DATA: {
+            uint64_t len = 0;
+            const char* p = plist_get_data_ptr(node, &len);
+            const auto* b = reinterpret_cast<const std::uint8_t*>(p);
+            return Value(Value::Data(b, b + (p ? len : 0)));
+        }
+        case PLIST_ARRAY: {
+            Value::Array a;
+            const uint32_t n = plist_array_get_size(node);
+            a.reserve(n);
+            for (uint32_t k = 0; k < n; ++k) {
+                auto v = fromPlist(plist_array_get_item(node, k));
+                if (!v) {
+                    return std::nullopt;
+                }
+                a.push_back(std::move(*v));
+            }
+            return Value(std::move(a));
+        }
+        case PLIST_DICT: {
+            Value::Dictionary d;
+            plist_dict_iter it = nullptr;
+            plist_dict_new_iter(node, &it);
+            for (;;) {
+                char* key = nullptr;
+                plist_t item = nullptr;
+                plist_dict_next_item(node, it, &key, &item);
+                if (!item) {
+                    std::free(key);
+                    break;
+                }
+                auto v = fromPlist(item);
+                std::string k = key ? key : "";
+                std::free(key);
+                if (!v) {
+                    std::free(it);
+                    return std::nullopt;
+                }
+                d.insert_or_assign(std::move(k), std::move(*v));
+            }
+            std::free(it);
+            return Value(std::move(d));
+        }
+        default:
+            return std::nullopt;
+    }
+}
+
+plist_t toPlist(const Value& v) {
+    switch (v.kind()) {
+        case Value::Kind::Null:
+            return nullptr;
+        case Value::Kind::Bool:
+            return plist_new_bool(*v.asBool() ? 1 : 0);
+        case Value::Kind::Integer:
+            return plist_new_uint(static_cast<uint64_t>(*v.asInteger()));
+        case Value::Kind::Real:
+            return plist_new_real(*v.asDouble());
+        case Value::Kind::String:
+            return plist_new_string(v.asString()->c_str());
+        case Value::Kind::Date: {
+            double rel = v.asDate()->secondsSince1970() - kSecondsFrom1970To2001;
+            double sec = std::floor(rel);
+            if (!std::isfinite(sec) || sec < std::numeric_limits<int32_t>::min() ||
+                sec > std::numeric_limits<int32_t>::max()) {
+                return nullptr;
+            }
+            auto usec = static_cast<int32_t>(std::llround((rel - sec) * 1e6));
+            if (usec >= 1000000) {
+                usec = 999999;
+            }
+            return plist_new_date(static_cast<int32_t>(sec), usec);
+        }
+        case Value::Kind::Data: {
+            const auto& d = *v.asData();
+            return plist_new_data(reinterpret_cast<const char*>(d.data()), d.size());
+        }
+        case Value::Kind::Array: {
+            PlistPtr a(plist_new_array());
+            for (const auto& e : *v.asArray()) {
+                plist_t item = toPlist(e);
+                if (!item) {
+                    return nullptr;
+                }
+                plist_array_append_item(a.get(), item);
+            }
+            return a.release();
+        }
+        case Value::Kind::Dictionary: {
+            PlistPtr d(plist_new_dict());
+            for (const auto& [k, e] : *v.asDictionary()) {
+                plist_t item = toPlist(e);
+                if (!item) {
+                    return nullptr;
+                }
+                plist_dict_set_item(d.get(), k.c_str(), item);
+            }
+            return d.release();
+        }
+    }
+    return nullptr;
+}
+
+}  // namespace
+
+bool isBinaryPlist(std::string_view bytes) { return bytes.starts_with("bplist00"); }
+
+bool plistStructureIsSafe(std::string_view bytes, std::string* error) {
+    if (bytes.empty()) {
+        setError(error, "empty document");
+        return false;
+    }
+    if (bytes.size() > kMaxPlistBytes) {
+        setError(error, "document larger than " + std::to_string(kMaxPlistBytes) + " bytes");
+        return false;
+    }
+    return isBinaryPlist(bytes) ? binaryStructureIsSafe(bytes, error)
+                                : xmlDepthIsSafe(bytes, error);
+}
+
+std::optional<Value> parsePlist(std::string_view bytes, std::string* error) {
+    if (!plistStructureIsSafe(bytes, error)) {
+        return std::nullopt;
+    }
+    plist_t root = nullptr;
+    if (isBinaryPlist(bytes)) {
+        plist_from_bin(bytes.data(), static_cast<uint32_t>(bytes.size()), &root);
+    } else {
+        plist_from_xml(bytes.data(), static_cast<uint32_t>(bytes.size()), &root);
+    }
+    if (!root) {
+        setError(error, "not a property list");
+        return std::nullopt;
+    }
+    PlistPtr guard(root);
+    auto value = fromPlist(root);
+    if (!value) {
+        setError(error, "property list holds an unsupported node");
+    }
+    return value;
+}
+
+std::optional<std::string> toXmlPlist(const Value& value) {
+    PlistPtr root(toPlist(value));
+    if (!root) {
+        return std::nullopt;
+    }
+    char* out = nullptr;
+    uint32_t len = 0;
+    plist_to_xml(root.get(), &out, &len);
+    if (!out) {
+        return std::nullopt;
+    }
+    std::string s(out, len);
+    plist_to_xml_free(out);
+    return s;
+}
+
+std::optional<std::string> toBinaryPlist(const Value& value) {
+    PlistPtr root(toPlist(value));
+    if (!root) {
+        return std::nullopt;
+    }
+    char* out = nullptr;
+    uint32_t len = 0;
+    plist_to_bin(root.get(), &out, &len);
+    if (!out) {
+        return std::nullopt;
+    }
+    std::string s(out, len);
+    plist_to_bin_free(out);
+    return s;
+}
+
+}  // namespace qax

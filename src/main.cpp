@@ -1,0 +1,6 @@
+#include "core/Log.h"
+
+int main() {
+    qax::qaxLog().info("launched");
+    return 0;
+}

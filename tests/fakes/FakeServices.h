@@ -1,0 +1,59 @@
+// In-memory test doubles of the simple platform services.
+#pragma once
+
+#include <map>
+#include <mutex>
+#include <optional>
+#include <string>
+
+#include "platform/DeviceProperties.h"
+#include "platform/LocaleInfo.h"
+#include "platform/PreferenceStore.h"
+
+namespace qax::test {
+
+class InMemoryPreferenceStore : public PreferenceStore {
+public:
+    void registerDefaults(const Value::Dictionary& defaults) override;
+    std::optional<Value> objectForKey(std::string_view key) override;
+    bool setObject(std::string_view key, const Value& value) override;
+    bool removeObject(std::string_view key) override;
+    std::vector<std::string> allKeys() override;
+
+    // Whether a value is stored (registered defaults do not count).
+    bool hasStoredValue(std::string_view key);
+
+private:
+    std::mutex mutex_;
+    Value::Dictionary defaults_;
+    Value::Dictionary stored_;
+};
+
+class FakeDeviceProperties : public DeviceProperties {
+public:
+    std::optional<Value> copyDeviceProperty(std::string_view name) override;
+    bool isInternalBuild() override { return internal; }
+
+    void set(const std::string& name, std::optional<Value> value);
+
+    bool internal = false;
+
+private:
+    std::mutex mutex_;
+    std::map<std::string, Value, std::less<>> properties_{
+        {"SerialNumber", Value("C02TESTSERIAL")},
+        {"ProductType", Value("Model9,1")},
+        {"ProductVersion", Value("4.2")},
+    };
+};
+
+class FakeLocaleInfo : public LocaleInfo {
+public:
+    std::string preferredLocaleIdentifier() override { return identifier; }
+    std::optional<std::string> preferredContentSizeCategory() override { return contentSize; }
+
+    std::string identifier = "en_US";
+    std::optional<std::string> contentSize = "UICTContentSizeCategoryL";
+};
+
+}  // namespace qax::test
