@@ -53,7 +53,7 @@ public:
     std::optional<std::string> preferredContentSizeCategory() override { return contentSize; }
 
     std::string identifier = "en_US";
-    std::optional<std::string> contentSize = "UICTContentSizeCategoryL";
+    std::optional<std::string> contentSize = "Large";
 };
 
 }  // namespace qax::test

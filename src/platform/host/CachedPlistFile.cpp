@@ -1,0 +1,44 @@
+#include "platform/host/CachedPlistFile.h"
+
+#include <sys/stat.h>
+
+#include "core/AtomicFile.h"
+#include "core/Log.h"
+#include "core/PlistCodec.h"
+
+namespace qax {
+
+std::optional<Value> CachedPlistFile::read() {
+    struct stat st {};
+    const bool exists = ::stat(path_.c_str(), &st) == 0;
+    const long long mtimeNs =
+        exists ? static_cast<long long>(st.st_mtim.tv_sec) * 1'000'000'000LL + st.st_mtim.tv_nsec
+               : -1;
+    std::lock_guard lock(mutex_);
+    if (loaded_ && (exists ? (st.st_dev == dev_ && st.st_ino == ino_ && st.st_size == size_ &&
+                              mtimeNs == mtimeNs_)
+                           : size_ == -1)) {
+        return value_;
+    }
+    loaded_ = true;
+    dev_ = exists ? st.st_dev : 0;
+    ino_ = exists ? st.st_ino : 0;
+    size_ = exists ? st.st_size : -1;
+    mtimeNs_ = mtimeNs;
+    value_.reset();
+    if (!exists) {
+        return value_;
+    }
+    auto bytes = readWholeFile(path_, kMaxPlistBytes);
+    std::string error;
+    if (bytes) {
+        value_ = parsePlist(*bytes, &error);
+    }
+    if (!value_) {
+        qaxLog().error("Ignoring unreadable platform file '%@': %@", path_,
+                       bytes ? error : std::string("cannot be read"));
+    }
+    return value_;
+}
+
+}  // namespace qax

@@ -1,0 +1,35 @@
+// A property-list file of the platform root (device.plist, features.plist, ...), parsed
+// once per change: the file is re-read only when its identity or modification time
+// changes, and the file on disk stays the truth. A missing or malformed file reads as
+// none. Thread-safe.
+#pragma once
+
+#include <sys/types.h>
+
+#include <mutex>
+#include <optional>
+#include <string>
+
+#include "core/Value.h"
+
+namespace qax {
+
+class CachedPlistFile {
+public:
+    explicit CachedPlistFile(std::string path) : path_(std::move(path)) {}
+
+    std::optional<Value> read();
+    const std::string& path() const { return path_; }
+
+private:
+    std::string path_;
+    std::mutex mutex_;
+    bool loaded_ = false;
+    dev_t dev_ = 0;
+    ino_t ino_ = 0;
+    off_t size_ = -1;
+    long long mtimeNs_ = -1;
+    std::optional<Value> value_;
+};
+
+}  // namespace qax
