@@ -50,6 +50,8 @@ LogArg toLogArg(const T& value) {
     using D = std::decay_t<T>;
     if constexpr (std::is_same_v<D, LogArg>) {
         return value;
+    } else if constexpr (std::is_array_v<T>) {
+        return LogArg{std::string(value)};
     } else if constexpr (std::is_same_v<D, std::nullptr_t>) {
         return LogArg{};
     } else if constexpr (std::is_same_v<D, bool>) {

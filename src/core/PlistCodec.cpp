@@ -354,6 +354,12 @@ std::optional<std::string> toXmlPlist(const Value& value) {
     }
     std::string s(out, len);
     plist_to_xml_free(out);
+    // The document type line is optional and only names the DTD's publisher; leave it out.
+    if (auto start = s.find("<!DOCTYPE"); start != std::string::npos) {
+        if (auto end = s.find(">\n", start); end != std::string::npos) {
+            s.erase(start, end + 2 - start);
+        }
+    }
     return s;
 }
 

@@ -1,0 +1,88 @@
+#include <gtest/gtest.h>
+
+#include "core/Base64.h"
+#include "core/Date.h"
+#include "core/Hash.h"
+#include "core/VersionCompare.h"
+
+namespace qax {
+namespace {
+
+TEST(VersionCompare, DigitRunsCompareNumerically) {
+    struct Row {
+        const char* a;
+        const char* b;
+        int sign;
+    } rows[] = {
+        {"4.10", "4.9", 1},   {"4.9", "4.10", -1},    {"4.2", "4.2", 0},
+        {"4.2.1", "4.2", 1},  {"4.2", "4.2.1", -1},   {"10.0", "9.9.9", 1},
+        {"4.02", "4.2", 0},   {"4.2b", "4.2a", 1},    {"", "", 0},
+        {"1", "", 1},         {"12A345", "12A99", 1}, {"99999999999999999999", "1", 1},
+    };
+    for (const auto& r : rows) {
+        int c = compareVersions(r.a, r.b);
+        EXPECT_EQ((c > 0) - (c < 0), r.sign) << r.a << " vs " << r.b;
+        EXPECT_EQ(isVersionGreater(r.a, r.b), r.sign > 0) << r.a << " vs " << r.b;
+    }
+}
+
+TEST(Sha256Hash, KnownDigests) {
+    struct Row {
+        std::string input;
+        const char* hex;
+    } rows[] = {
+        {"", "e3b0c44298fc1c149afbf4c8996fb92427ae41e4649b934ca495991b7852b855"},
+        {"abc", "ba7816bf8f01cfea414140de5dae2223b00361a396177a9cb410ff61f20015ad"},
+        // Only the bytes before the first zero byte count.
+        {std::string("abc\0def", 7),
+         "ba7816bf8f01cfea414140de5dae2223b00361a396177a9cb410ff61f20015ad"},
+    };
+    for (const auto& r : rows) {
+        EXPECT_EQ(sha256Hash(r.input), r.hex);
+    }
+    EXPECT_EQ(sha256Hash("C02TESTSERIAL").size(), 64u);
+}
+
+TEST(Base64, RoundTripsWithPaddingAndNoLineBreaks) {
+    struct Row {
+        std::string raw;
+        const char* encoded;
+    } rows[] = {{"", ""}, {"f", "Zg=="}, {"fo", "Zm8="}, {"foo", "Zm9v"}, {"foob", "Zm9vYg=="}};
+    for (const auto& r : rows) {
+        EXPECT_EQ(base64Encode(r.raw), r.encoded);
+        auto back = base64Decode(r.encoded);
+        ASSERT_TRUE(back);
+        EXPECT_EQ(std::string(back->begin(), back->end()), r.raw);
+    }
+    std::string big(1000, 'x');
+    EXPECT_EQ(base64Encode(big).find('\n'), std::string::npos);
+    EXPECT_FALSE(base64Decode("abc"));
+    EXPECT_FALSE(base64Decode("a*b="));
+}
+
+TEST(DateFormats, Iso8601ParseAndPrint) {
+    struct Row {
+        const char* text;
+        double seconds;
+    } rows[] = {
+        {"2023-11-14T22:13:20Z", 1700000000},
+        {"2023-11-14T22:13:20.500Z", 1700000000.5},
+        {"2023-11-14T23:13:20+01:00", 1700000000},
+        {"2023-11-14T21:43:20-0030", 1700000000},
+        {"1970-01-01", 0},
+        {"2286-11-20T17:46:40Z", 10000000000},
+    };
+    for (const auto& r : rows) {
+        auto d = Date::parseIso8601(r.text);
+        ASSERT_TRUE(d) << r.text;
+        EXPECT_DOUBLE_EQ(d->secondsSince1970(), r.seconds) << r.text;
+    }
+    for (const char* bad : {"", "yesterday", "2023-13-01", "2023-11-14T25:00:00Z", "2023-11-14Tx"}) {
+        EXPECT_FALSE(Date::parseIso8601(bad)) << bad;
+    }
+    EXPECT_EQ(Date(1700000000).iso8601(), "2023-11-14T22:13:20.000Z");
+    EXPECT_EQ(Date(1700000000.9999).iso8601(), "2023-11-14T22:13:21.000Z");
+}
+
+}  // namespace
+}  // namespace qax
