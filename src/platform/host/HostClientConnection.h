@@ -1,0 +1,80 @@
+// One client of the agent's Unix socket. Socket I/O runs on the main io_context (the main
+// thread); requests are handed, one at a time and in arrival order, to the connection's own
+// serial queue, where the exported interface calls the exported object; replies may come from
+// any thread and in any order, and are encoded on the replying thread and written from the
+// main thread. The peer facts and the exported interface and object are set by the listener
+// before resume() and guarded by a mutex.
+#pragma once
+
+#include <sys/types.h>
+
+#include <asio/local/stream_protocol.hpp>
+#include <asio/steady_timer.hpp>
+#include <cstdint>
+#include <deque>
+#include <memory>
+#include <mutex>
+#include <string>
+
+#include "core/TaskRunner.h"
+#include "platform/ServiceListener.h"
+#include "platform/host/IpcFrameCodec.h"
+
+namespace qax {
+
+class HostClientConnection : public ClientConnection,
+                             public std::enable_shared_from_this<HostClientConnection> {
+  public:
+    using Socket = asio::local::stream_protocol::socket;
+
+    // Called on the main thread; `requestQueue` is the connection's serial queue.
+    HostClientConnection(Socket socket, std::shared_ptr<TaskRunner> requestQueue);
+    ~HostClientConnection() override;
+
+    pid_t peerProcessIdentifier() const override;
+    std::optional<Value> entitlementValue(const std::string& name) const override;
+    void exportInterface(std::shared_ptr<const RemoteInterface> interface) override;
+    void exportObject(std::shared_ptr<ExportedObject> object) override;
+    void resume() override;
+
+    // Set by the listener after checking the peer, before the delegate is asked.
+    void setPeer(pid_t pid, Value::Dictionary entitlements);
+    int nativeHandle() { return socket_.native_handle(); }
+    // Closes the socket from any thread; requests still running reply into the void.
+    void close();
+    // The same, on the main thread.
+    void closeNow();
+
+  private:
+    void readMore();
+    void handleBytes(std::size_t n);
+    // False when the connection had to be closed.
+    bool handleFrame(const std::string& payload);
+    void armIdleTimer();
+    void sendReply(std::int64_t id, RemoteReply reply);
+    void enqueueWrite(std::string frame);
+    void writeNext();
+    void closeWithError(const std::string& reason);
+
+    Socket socket_;
+    asio::steady_timer idleTimer_;
+    std::shared_ptr<TaskRunner> requestQueue_;
+
+    mutable std::mutex mutex_;
+    pid_t pid_ = 0;
+    Value::Dictionary entitlements_;
+    std::shared_ptr<const RemoteInterface> interface_;
+    std::shared_ptr<ExportedObject> object_;
+
+    // Main thread only.
+    IpcFrameCodec decoder_;
+    std::string readBuffer_;
+    std::deque<std::string> writeQueue_;
+    bool reading_ = false;
+    bool writing_ = false;
+    bool closed_ = false;
+    bool resumed_ = false;
+    int inFlight_ = 0;
+};
+
+}  // namespace qax

@@ -1,0 +1,146 @@
+#include "platform/host/HostServiceListener.h"
+
+#include <sys/socket.h>
+#include <unistd.h>
+
+#include <asio/post.hpp>
+#include <asio/steady_timer.hpp>
+#include <chrono>
+
+#include "core/Log.h"
+#include "platform/host/HostClientConnection.h"
+#include "platform/host/HostPeerVerifier.h"
+#include "platform/host/HostUnixSocketPath.h"
+
+namespace qax {
+namespace {
+
+constexpr auto kAcceptRetryDelay = std::chrono::milliseconds(100);
+
+}  // namespace
+
+HostServiceListener::HostServiceListener(std::string serviceName, std::string socketPath,
+                                         std::shared_ptr<AsioDispatcher> dispatcher,
+                                         std::shared_ptr<ApplicationRegistry> applications)
+    : serviceName_(std::move(serviceName)),
+      socketPath_(std::move(socketPath)),
+      dispatcher_(std::move(dispatcher)),
+      applications_(std::move(applications)),
+      listenerQueue_(dispatcher_->makeSerialQueue(serviceName_ + ".listener")),
+      acceptor_(dispatcher_->mainContext()) {}
+
+HostServiceListener::~HostServiceListener() {
+    if (listening_) {
+        asio::error_code ec;
+        acceptor_.close(ec);
+        ::unlink(socketPath_.c_str());
+    }
+}
+
+void HostServiceListener::setDelegate(std::shared_ptr<ServiceListenerDelegate> delegate) {
+    std::lock_guard lock(mutex_);
+    delegate_ = std::move(delegate);
+}
+
+bool HostServiceListener::resume() {
+    if (listening_) {
+        return true;
+    }
+    std::string error;
+    if (!HostUnixSocketPath::claim(socketPath_, SOCK_STREAM, &error)) {
+        qaxLog().error("Cannot listen for %@: %@", serviceName_, error);
+        return false;
+    }
+    asio::error_code ec;
+    acceptor_.open(asio::local::stream_protocol(), ec);
+    if (!ec) {
+        acceptor_.bind(asio::local::stream_protocol::endpoint(socketPath_), ec);
+    }
+    if (!ec) {
+        acceptor_.listen(asio::socket_base::max_listen_connections, ec);
+    }
+    if (ec) {
+        qaxLog().error("Cannot listen for %@ on %@: %@", serviceName_, socketPath_, ec.message());
+        acceptor_.close(ec);
+        return false;
+    }
+    listening_ = true;
+    acceptNext();
+    return true;
+}
+
+void HostServiceListener::acceptNext() {
+    acceptor_.async_accept(
+        [self = shared_from_this()](const asio::error_code& ec,
+                                    asio::local::stream_protocol::socket socket) {
+            if (ec == asio::error::operation_aborted || !self->listening_) {
+                return;
+            }
+            if (!ec) {
+                auto connection = std::make_shared<HostClientConnection>(
+                    std::move(socket), self->dispatcher_->makeSerialQueue(self->serviceName_));
+                const auto id = self->nextConnection_++;
+                self->connections_[id] = connection;
+                // Forget connections that have gone, now and then, so the table stays small.
+                if (id % 64 == 0) {
+                    std::erase_if(self->connections_,
+                                  [](const auto& entry) { return entry.second.expired(); });
+                }
+                self->offer(connection);
+                self->acceptNext();
+                return;
+            }
+            // Out of descriptors and the like: keep serving the clients already connected and
+            // try again shortly rather than spinning.
+            qaxLog().error("Accepting a client of %@ failed: %@", self->serviceName_, ec.message());
+            auto timer = std::make_shared<asio::steady_timer>(self->dispatcher_->mainContext(),
+                                                              kAcceptRetryDelay);
+            timer->async_wait([self, timer](const asio::error_code& waitError) {
+                if (!waitError && self->listening_) {
+                    self->acceptNext();
+                }
+            });
+        });
+}
+
+void HostServiceListener::offer(const std::shared_ptr<HostClientConnection>& connection) {
+    listenerQueue_->post([self = shared_from_this(), connection] {
+        std::string error;
+        auto peer =
+            HostPeerVerifier::verify(connection->nativeHandle(), *self->applications_, &error);
+        if (peer) {
+            connection->setPeer(peer->pid, std::move(peer->entitlements));
+        } else {
+            // An unverifiable client holds no entitlements, so the delegate refuses it.
+            auto cred = HostPeerVerifier::peerCredentials(connection->nativeHandle());
+            connection->setPeer(cred ? cred->first : 0, {});
+            qaxLog().error("Cannot verify a client of %@: %@", self->serviceName_, error);
+        }
+        std::shared_ptr<ServiceListenerDelegate> delegate;
+        {
+            std::lock_guard lock(self->mutex_);
+            delegate = self->delegate_;
+        }
+        if (!delegate || !delegate->shouldAcceptNewConnection(*self, connection)) {
+            connection->close();
+        }
+    });
+}
+
+void HostServiceListener::invalidate() {
+    if (!listening_) {
+        return;
+    }
+    listening_ = false;
+    asio::error_code ec;
+    acceptor_.close(ec);
+    ::unlink(socketPath_.c_str());
+    for (auto& [id, weak] : connections_) {
+        if (auto connection = weak.lock()) {
+            connection->closeNow();
+        }
+    }
+    connections_.clear();
+}
+
+}  // namespace qax
