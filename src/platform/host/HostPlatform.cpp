@@ -6,9 +6,18 @@
 #include <cstdlib>
 #include <filesystem>
 
+#include "platform/host/CurlHttpClient.h"
 #include "platform/host/FilePreferenceStore.h"
+#include "platform/host/HostApplicationRegistry.h"
 #include "platform/host/HostDeviceProperties.h"
+#include "platform/host/HostFeatureFlags.h"
+#include "platform/host/HostLaunchEventStream.h"
 #include "platform/host/HostLocaleInfo.h"
+#include "platform/host/HostNotificationSocket.h"
+#include "platform/host/HostPairedDeviceRegistry.h"
+#include "platform/host/HostProcessBundleLookup.h"
+#include "platform/host/HostServiceListenerFactory.h"
+#include "platform/host/HostSystemNotificationCenter.h"
 #include "platform/host/SystemClock.h"
 
 namespace qax {
@@ -47,7 +56,18 @@ std::shared_ptr<Platform> makeHostPlatform(const HostEnvironment& environment,
     p->deviceProperties = std::make_shared<HostDeviceProperties>(environment.platformRoot);
     p->locale = std::make_shared<HostLocaleInfo>();
 
+    p->http =
+        std::make_shared<CurlHttpClient>(CurlHttpClient::optionsForPlatformRoot(p->platformRoot));
     // Further host bindings are installed here, one line each.
+    p->pairedDevices = std::make_shared<HostPairedDeviceRegistry>(p->platformRoot);
+    p->featureFlags = std::make_shared<HostFeatureFlags>(p->platformRoot);
+    p->applications = std::make_shared<HostApplicationRegistry>(p->platformRoot);
+    p->processes = std::make_shared<HostProcessBundleLookup>(p->applications);
+    p->ipc = std::make_shared<HostServiceListenerFactory>(p->runtimeDirectory, p->dispatcher,
+                                                          p->applications);
+    auto notificationSocket = std::make_shared<HostNotificationSocket>(p->runtimeDirectory);
+    p->notifications = std::make_shared<HostSystemNotificationCenter>(notificationSocket);
+    p->launchEvents = std::make_shared<HostLaunchEventStream>(notificationSocket, p->dispatcher);
     return p;
 }
 
