@@ -8,7 +8,7 @@ namespace {
 
 template <typename Executor>
 class AsioRunner : public TaskRunner {
-public:
+  public:
     explicit AsioRunner(Executor ex) : ex_(std::move(ex)) {}
 
     void post(Task task) override { asio::post(ex_, std::move(task)); }
@@ -28,7 +28,7 @@ public:
         });
     }
 
-private:
+  private:
     Executor ex_;
 };
 
@@ -45,24 +45,30 @@ struct AsioDispatcher::State {
 
 AsioDispatcher::AsioDispatcher(unsigned backgroundThreads, unsigned blockingThreads)
     : state_(std::make_unique<State>(backgroundThreads, blockingThreads)) {
-    main_ = std::make_shared<AsioRunner<asio::io_context::executor_type>>(
-        state_->io.get_executor());
-    background_ = std::make_shared<AsioRunner<asio::thread_pool::executor_type>>(
-        state_->pool.get_executor());
+    main_ =
+        std::make_shared<AsioRunner<asio::io_context::executor_type>>(state_->io.get_executor());
+    background_ =
+        std::make_shared<AsioRunner<asio::thread_pool::executor_type>>(state_->pool.get_executor());
     blocking_ = std::make_shared<AsioRunner<asio::thread_pool::executor_type>>(
         state_->blockingPool.get_executor());
 }
 
-AsioDispatcher::~AsioDispatcher() { shutdown(); }
+AsioDispatcher::~AsioDispatcher() {
+    shutdown();
+}
 
 std::shared_ptr<TaskRunner> AsioDispatcher::makeSerialQueue(std::string) {
     using Strand = asio::strand<asio::thread_pool::executor_type>;
     return std::make_shared<AsioRunner<Strand>>(asio::make_strand(state_->pool.get_executor()));
 }
 
-asio::io_context& AsioDispatcher::mainContext() { return state_->io; }
+asio::io_context& AsioDispatcher::mainContext() {
+    return state_->io;
+}
 
-void AsioDispatcher::runMainLoop() { state_->io.run(); }
+void AsioDispatcher::runMainLoop() {
+    state_->io.run();
+}
 
 void AsioDispatcher::stopMainLoop() {
     state_->work.reset();

@@ -16,7 +16,7 @@ class thread_pool;
 namespace qax {
 
 class AsioDispatcher : public Dispatcher, public std::enable_shared_from_this<AsioDispatcher> {
-public:
+  public:
     explicit AsioDispatcher(unsigned backgroundThreads = 4, unsigned blockingThreads = 16);
     ~AsioDispatcher() override;
 
@@ -32,7 +32,7 @@ public:
     // Stops accepting work and joins the pools.
     void shutdown();
 
-private:
+  private:
     struct State;
     std::unique_ptr<State> state_;
     std::shared_ptr<TaskRunner> main_;

@@ -11,7 +11,7 @@
 namespace qax {
 
 class Clock {
-public:
+  public:
     virtual ~Clock() = default;
     virtual Date now() const = 0;
     // Offset of the local time zone from GMT at `at`, in seconds (east positive).
@@ -20,7 +20,7 @@ public:
 
 // A clock that only moves when told to: tests and the virtual-time task runner.
 class ManualClock : public Clock {
-public:
+  public:
     explicit ManualClock(Date start = Date(1'700'000'000.0), int secondsFromGMT = 0)
         : now_(start.secondsSince1970()), offset_(secondsFromGMT) {}
     Date now() const override { return Date(now_.load()); }
@@ -30,7 +30,7 @@ public:
     void advanceBy(double seconds) { now_.store(now_.load() + seconds); }
     void setSecondsFromGMT(int offset) { offset_.store(offset); }
 
-private:
+  private:
     std::atomic<double> now_;
     std::atomic<int> offset_;
 };

@@ -96,12 +96,12 @@ std::optional<Date> Date::parseIso8601(std::string_view text) {
             pos += 1 + static_cast<std::size_t>(n);
         }
     }
-    if (pos != s.size() || mo < 1 || mo > 12 || d < 1 || d > 31 || h > 23 || mi > 59 ||
-        sec < 0 || sec >= 61) {
+    if (pos != s.size() || mo < 1 || mo > 12 || d < 1 || d > 31 || h > 23 || mi > 59 || sec < 0 ||
+        sec >= 61) {
         return std::nullopt;
     }
-    double days = static_cast<double>(daysFromCivil(y, static_cast<unsigned>(mo),
-                                                    static_cast<unsigned>(d)));
+    double days =
+        static_cast<double>(daysFromCivil(y, static_cast<unsigned>(mo), static_cast<unsigned>(d)));
     return Date(days * 86400.0 + h * 3600.0 + mi * 60.0 + sec - offset);
 }
 

@@ -13,7 +13,7 @@ namespace qax {
 inline constexpr double kSecondsFrom1970To2001 = 978307200.0;
 
 class Date {
-public:
+  public:
     constexpr Date() = default;
     constexpr explicit Date(double secondsSince1970) : seconds_(secondsSince1970) {}
 
@@ -34,7 +34,7 @@ public:
     // "2023-11-14T22:13:20.5+01:00". No value when the text is not such a date.
     static std::optional<Date> parseIso8601(std::string_view text);
 
-private:
+  private:
     double seconds_ = 0;
 };
 

@@ -12,7 +12,7 @@
 namespace qax {
 
 class JoinCounter {
-public:
+  public:
     void enter();
     // Leaving more often than entering is a programming error and is ignored.
     void leave();
@@ -21,7 +21,7 @@ public:
     void notify(std::shared_ptr<TaskRunner> runner, Task task);
     int outstanding() const;
 
-private:
+  private:
     mutable std::mutex mutex_;
     int count_ = 0;
     std::vector<std::pair<std::shared_ptr<TaskRunner>, Task>> waiting_;

@@ -9,13 +9,15 @@ namespace {
 
 // Builds a Value straight from parser events, refusing documents nested too deeply.
 class ValueSax : public nlohmann::json_sax<nlohmann::json> {
-public:
+  public:
     std::optional<Value> result;
     std::string error;
 
     bool null() override { return add(Value()); }
     bool boolean(bool b) override { return add(Value(b)); }
-    bool number_integer(number_integer_t i) override { return add(Value(static_cast<long long>(i))); }
+    bool number_integer(number_integer_t i) override {
+        return add(Value(static_cast<long long>(i)));
+    }
     bool number_unsigned(number_unsigned_t u) override {
         return add(Value(static_cast<unsigned long long>(u)));
     }
@@ -37,7 +39,7 @@ public:
         return false;
     }
 
-private:
+  private:
     bool add(Value v) {
         if (stack_.empty()) {
             result = std::move(v);

@@ -116,8 +116,8 @@ std::string formatLogMessage(std::string_view format, const std::vector<LogArg>&
             precision = p;
             j = k;
         }
-        while (j < format.size() && (format[j] == 'l' || format[j] == 'h' || format[j] == 'z' ||
-                                     format[j] == 'q')) {
+        while (j < format.size() &&
+               (format[j] == 'l' || format[j] == 'h' || format[j] == 'z' || format[j] == 'q')) {
             ++j;
         }
         if (j >= format.size()) {

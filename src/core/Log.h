@@ -25,7 +25,7 @@ const char* logLevelName(LogLevel level);
 
 // Where formatted messages go. The host writes to stderr; tests capture.
 class LogSink {
-public:
+  public:
     virtual ~LogSink() = default;
     virtual void write(LogLevel level, std::string_view subsystem, std::string_view category,
                        std::string_view message) = 0;
@@ -70,9 +70,15 @@ LogArg toLogArg(const T& value) {
         return LogArg{std::string(std::string_view(value))};
     } else if constexpr (HasDescription<D>) {
         return LogArg{std::string(value.description())};
-    } else if constexpr (requires { value.has_value(); *value; }) {
+    } else if constexpr (requires {
+                             value.has_value();
+                             *value;
+                         }) {
         return value ? toLogArg(*value) : LogArg{};
-    } else if constexpr (requires { value.get(); *value; }) {
+    } else if constexpr (requires {
+                             value.get();
+                             *value;
+                         }) {
         return value ? toLogArg(*value) : LogArg{};
     } else {
         static_assert(sizeof(D) == 0, "type cannot be logged");
@@ -84,7 +90,7 @@ std::string formatLogMessage(std::string_view format, const std::vector<LogArg>&
                              bool showPrivate);
 
 class Log {
-public:
+  public:
     Log(std::string subsystem, std::string category, std::shared_ptr<LogSink> sink);
 
     template <typename... A>
@@ -114,7 +120,7 @@ public:
     // Rebinds the handle (start-up binds the platform's sink; tests bind a capturing one).
     void setSink(std::shared_ptr<LogSink> sink);
 
-private:
+  private:
     const std::string subsystem_;
     const std::string category_;
     mutable std::mutex mutex_;
@@ -130,7 +136,7 @@ Log& qaxLog();
 // One line per message on stderr: time, level, subsystem:category, message. Reads
 // QAX_LOG_LEVEL ("debug" shows debug lines) and QAX_LOG_PRIVATE ("1" shows private values).
 class StderrLogSink : public LogSink {
-public:
+  public:
     StderrLogSink();
     StderrLogSink(bool debug, bool showPrivate) : debug_(debug), private_(showPrivate) {}
     void write(LogLevel level, std::string_view subsystem, std::string_view category,
@@ -138,7 +144,7 @@ public:
     bool isEnabled(LogLevel level) const override { return level != LogLevel::Debug || debug_; }
     bool showsPrivate() const override { return private_; }
 
-private:
+  private:
     bool debug_ = false;
     bool private_ = false;
     std::mutex mutex_;
@@ -146,7 +152,7 @@ private:
 
 // Keeps every message in memory, for tests to assert on.
 class CapturingLogSink : public LogSink {
-public:
+  public:
     struct Entry {
         LogLevel level;
         std::string message;
@@ -166,7 +172,7 @@ public:
     int countContaining(std::string_view fragment) const;
     void clear();
 
-private:
+  private:
     bool private_;
     mutable std::mutex mutex_;
     std::vector<Entry> entries_;

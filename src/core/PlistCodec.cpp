@@ -120,8 +120,8 @@ bool binaryStructureIsSafe(std::string_view s, std::string* error) {
             return false;
         }
         if (item.depth > kMaxValueDepth + 1) {
-            setError(error, "document nested deeper than " + std::to_string(kMaxValueDepth) +
-                                " levels");
+            setError(error,
+                     "document nested deeper than " + std::to_string(kMaxValueDepth) + " levels");
             return false;
         }
         std::uint64_t off = 0;
@@ -304,7 +304,9 @@ plist_t toPlist(const Value& v) {
 
 }  // namespace
 
-bool isBinaryPlist(std::string_view bytes) { return bytes.starts_with("bplist00"); }
+bool isBinaryPlist(std::string_view bytes) {
+    return bytes.starts_with("bplist00");
+}
 
 bool plistStructureIsSafe(std::string_view bytes, std::string* error) {
     if (bytes.empty()) {

@@ -13,7 +13,7 @@ namespace qax {
 using Task = std::function<void()>;
 
 class TaskRunner {
-public:
+  public:
     virtual ~TaskRunner() = default;
     virtual void post(Task task) = 0;
     // Runs `task` no earlier than `seconds` from now (a negative delay runs it at once).
@@ -21,7 +21,7 @@ public:
 };
 
 class Dispatcher {
-public:
+  public:
     virtual ~Dispatcher() = default;
     // The main queue: start-up, system notifications, timers, scheduler results.
     virtual std::shared_ptr<TaskRunner> mainQueue() = 0;

@@ -17,7 +17,7 @@
 namespace qax {
 
 class Value {
-public:
+  public:
     enum class Kind { Null, Bool, Integer, Real, String, Date, Data, Array, Dictionary };
 
     using Array = std::vector<Value>;
@@ -88,7 +88,7 @@ public:
 
     static const char* kindName(Kind k);
 
-private:
+  private:
     void describe(std::string& out, int indent, bool topLevel) const;
 
     std::variant<std::monostate, bool, std::int64_t, double, std::string, qax::Date, Data, Array,

@@ -8,7 +8,9 @@ namespace qax {
 VirtualTimeTaskRunner::VirtualTimeTaskRunner(std::shared_ptr<ManualClock> clock)
     : clock_(std::move(clock)) {}
 
-void VirtualTimeTaskRunner::post(Task task) { postDelayed(std::move(task), 0); }
+void VirtualTimeTaskRunner::post(Task task) {
+    postDelayed(std::move(task), 0);
+}
 
 void VirtualTimeTaskRunner::postDelayed(Task task, double seconds) {
     const double due = clock_->now().secondsSince1970() + std::max(0.0, seconds);

@@ -18,7 +18,7 @@ namespace qax {
 
 class VirtualTimeTaskRunner : public TaskRunner,
                               public std::enable_shared_from_this<VirtualTimeTaskRunner> {
-public:
+  public:
     explicit VirtualTimeTaskRunner(std::shared_ptr<ManualClock> clock);
 
     void post(Task task) override;
@@ -37,7 +37,7 @@ public:
     std::optional<Date> nextDueTime() const;
     const std::shared_ptr<ManualClock>& clock() const { return clock_; }
 
-private:
+  private:
     bool runNextDueBy(double limit);
 
     std::shared_ptr<ManualClock> clock_;
@@ -48,7 +48,7 @@ private:
 
 // Every queue of this dispatcher is the one virtual-time runner.
 class VirtualTimeDispatcher : public Dispatcher {
-public:
+  public:
     explicit VirtualTimeDispatcher(std::shared_ptr<VirtualTimeTaskRunner> runner)
         : runner_(std::move(runner)) {}
     std::shared_ptr<TaskRunner> mainQueue() override { return runner_; }
@@ -57,7 +57,7 @@ public:
     std::shared_ptr<TaskRunner> blockingQueue() override { return runner_; }
     const std::shared_ptr<VirtualTimeTaskRunner>& runner() const { return runner_; }
 
-private:
+  private:
     std::shared_ptr<VirtualTimeTaskRunner> runner_;
 };
 

@@ -9,7 +9,7 @@
 namespace qax {
 
 class AnalyticsSink {
-public:
+  public:
     virtual ~AnalyticsSink() = default;
     // `payload` is called only if the event is recorded.
     virtual void sendEventLazily(const std::string& name, std::function<Value()> payload) = 0;

@@ -21,7 +21,7 @@ struct ActivityCriteria {
 
 // One platform activity, identified by its identifier.
 class BackgroundActivity {
-public:
+  public:
     virtual ~BackgroundActivity() = default;
     virtual const std::string& identifier() const = 0;
     virtual void setPreregistered(bool preregistered) = 0;
@@ -36,7 +36,7 @@ public:
 };
 
 class BackgroundActivityScheduler {
-public:
+  public:
     virtual ~BackgroundActivityScheduler() = default;
     virtual std::shared_ptr<BackgroundActivity> activityWithIdentifier(
         const std::string& identifier) = 0;

@@ -9,7 +9,7 @@
 namespace qax {
 
 class DeviceProperties {
-public:
+  public:
     virtual ~DeviceProperties() = default;
     // "SerialNumber", "ProductType", "ProductVersion", ...: none when the device has no
     // such property.

@@ -56,7 +56,7 @@ inline constexpr const char* kFollowUpRelativePluralDaysFormatKey = "RelativePlu
 inline constexpr const char* kFollowUpSettingsTargetBundleIdentifier = "com.velmora.Preferences";
 
 class FollowUpCenter {
-public:
+  public:
     virtual ~FollowUpCenter() = default;
     // Posting replaces an item with the same unique identifier. False with `error` set
     // when the item could not be stored.

@@ -14,7 +14,7 @@ namespace qax {
 // A mutable HTTP request. Header names compare without regard to case; setting a name again
 // replaces its value, and setting no value removes the field.
 class HttpRequest {
-public:
+  public:
     HttpRequest() = default;
     explicit HttpRequest(std::string url, double timeoutSeconds = 60)
         : url_(std::move(url)), timeout_(timeoutSeconds) {}
@@ -37,7 +37,7 @@ public:
     const std::optional<std::string>& body() const { return body_; }
     void setBody(std::optional<std::string> body) { body_ = std::move(body); }
 
-private:
+  private:
     std::string url_;
     std::string method_ = "GET";
     double timeout_ = 60;
@@ -59,7 +59,7 @@ struct HttpResult {
 };
 
 class HttpClient {
-public:
+  public:
     virtual ~HttpClient() = default;
     // Sends the request; `completion` runs exactly once, on the session's callback thread.
     virtual void send(const HttpRequest& request, std::function<void(HttpResult)> completion) = 0;

@@ -7,7 +7,7 @@
 namespace qax {
 
 class LocaleInfo {
-public:
+  public:
     virtual ~LocaleInfo() = default;
     // Language and region, for example "en_US" or "fr_FR".
     virtual std::string preferredLocaleIdentifier() = 0;

@@ -7,7 +7,9 @@ namespace qax {
 namespace {
 
 // Leading decimal number of a string, as the platform's typed reads take it.
-double leadingNumber(const std::string& s) { return std::strtod(s.c_str(), nullptr); }
+double leadingNumber(const std::string& s) {
+    return std::strtod(s.c_str(), nullptr);
+}
 
 }  // namespace
 

@@ -14,7 +14,7 @@
 namespace qax {
 
 class PreferenceStore {
-public:
+  public:
     virtual ~PreferenceStore() = default;
 
     // Values returned by reads while nothing is stored under their keys; never persisted.

@@ -17,7 +17,7 @@ struct PurchaseRecord {
 };
 
 class PurchaseHistory {
-public:
+  public:
     virtual ~PurchaseHistory() = default;
     virtual void purchasesForAccount(
         std::int64_t storeAccountId, const std::vector<std::string>& bundleIdentifiers,

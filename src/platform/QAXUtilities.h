@@ -12,7 +12,7 @@ namespace qax {
 struct Platform;
 
 class QAXUtilities {
-public:
+  public:
     // Whether the installed system is an internal build; evaluated on every call.
     static bool isInternal(const Platform& platform);
 

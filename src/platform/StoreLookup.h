@@ -18,7 +18,7 @@ struct StoreItem {
 };
 
 class StoreLookup {
-public:
+  public:
     virtual ~StoreLookup() = default;
     // Looks one bundle identifier up with the store's compact-listing key profile.
     virtual void lookUpBundleIdentifier(

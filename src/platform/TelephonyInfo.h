@@ -13,7 +13,7 @@ struct SubscriberCarrier {
 };
 
 class TelephonyInfo {
-public:
+  public:
     virtual ~TelephonyInfo() = default;
     // One entry per subscription.
     virtual std::vector<SubscriberCarrier> subscriberCarriers() = 0;

@@ -19,7 +19,9 @@ namespace {
 TEST(AtomicFileTest, KilledWriterLeavesOldOrNewNeverTorn) {
     test::TempDir dir;
     const std::string path = (dir.path() / "state.plist").string();
-    auto generation = [](int n) { return std::string(256 * 1024, static_cast<char>('a' + n % 26)); };
+    auto generation = [](int n) {
+        return std::string(256 * 1024, static_cast<char>('a' + n % 26));
+    };
     ASSERT_TRUE(writeFileAtomically(path, generation(0)));
 
     std::mt19937 rng(12345);

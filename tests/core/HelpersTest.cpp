@@ -14,10 +14,10 @@ TEST(VersionCompare, DigitRunsCompareNumerically) {
         const char* b;
         int sign;
     } rows[] = {
-        {"4.10", "4.9", 1},   {"4.9", "4.10", -1},    {"4.2", "4.2", 0},
-        {"4.2.1", "4.2", 1},  {"4.2", "4.2.1", -1},   {"10.0", "9.9.9", 1},
-        {"4.02", "4.2", 0},   {"4.2b", "4.2a", 1},    {"", "", 0},
-        {"1", "", 1},         {"12A345", "12A99", 1}, {"99999999999999999999", "1", 1},
+        {"4.10", "4.9", 1},  {"4.9", "4.10", -1},    {"4.2", "4.2", 0},
+        {"4.2.1", "4.2", 1}, {"4.2", "4.2.1", -1},   {"10.0", "9.9.9", 1},
+        {"4.02", "4.2", 0},  {"4.2b", "4.2a", 1},    {"", "", 0},
+        {"1", "", 1},        {"12A345", "12A99", 1}, {"99999999999999999999", "1", 1},
     };
     for (const auto& r : rows) {
         int c = compareVersions(r.a, r.b);
@@ -77,7 +77,8 @@ TEST(DateFormats, Iso8601ParseAndPrint) {
         ASSERT_TRUE(d) << r.text;
         EXPECT_DOUBLE_EQ(d->secondsSince1970(), r.seconds) << r.text;
     }
-    for (const char* bad : {"", "yesterday", "2023-13-01", "2023-11-14T25:00:00Z", "2023-11-14Tx"}) {
+    for (const char* bad :
+         {"", "yesterday", "2023-13-01", "2023-11-14T25:00:00Z", "2023-11-14Tx"}) {
         EXPECT_FALSE(Date::parseIso8601(bad)) << bad;
     }
     EXPECT_EQ(Date(1700000000).iso8601(), "2023-11-14T22:13:20.000Z");

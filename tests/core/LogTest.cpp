@@ -25,7 +25,8 @@ TEST(LogFormat, EveryDirective) {
         {"%@", {toLogArg(Value(Value::Dictionary{{"a", 1}}))}, "{\n    a = 1;\n}"},
         {"%@", {toLogArg(Described{})}, "<QAXDevice Default Device>"},
         {"%@", {toLogArg(std::make_shared<Described>())}, "<QAXDevice Default Device>"},
-        {"%s : %d", {toLogArg("+[QAXWarranty warrantyWithDictionary:serialNumber:]"), toLogArg(1)},
+        {"%s : %d",
+         {toLogArg("+[QAXWarranty warrantyWithDictionary:serialNumber:]"), toLogArg(1)},
          "+[QAXWarranty warrantyWithDictionary:serialNumber:] : 1"},
         {"%{public}s", {toLogArg("public")}, "public"},
         {"%ld and %lu", {toLogArg(-5L), toLogArg(7UL)}, "-5 and 7"},
@@ -47,8 +48,7 @@ TEST(LogFormat, PrivateArgumentsAreRedactedUnlessPrivateLoggingIsOn) {
     const char* format = "default device SerialNumber: '%{private}@' (%{public}d)";
     EXPECT_EQ(formatLogMessage(format, args, false),
               "default device SerialNumber: '<private>' (3)");
-    EXPECT_EQ(formatLogMessage(format, args, true),
-              "default device SerialNumber: 'C02SERIAL' (3)");
+    EXPECT_EQ(formatLogMessage(format, args, true), "default device SerialNumber: 'C02SERIAL' (3)");
 }
 
 TEST(LogLevels, SinksFilterDebugAndHandleRebinds) {

@@ -126,11 +126,11 @@ TEST(ValueCodec, HostileDocumentsAreRefusedBeforeParsing) {
     EXPECT_FALSE(parseJson(nested("[", "]", 100000, "1")));
 
     const std::string head = "<?xml version=\"1.0\"?><plist version=\"1.0\">";
-    EXPECT_TRUE(parsePlist(head + nested("<array>", "</array>", kMaxValueDepth, "<true/>") +
-                           "</plist>"));
+    EXPECT_TRUE(
+        parsePlist(head + nested("<array>", "</array>", kMaxValueDepth, "<true/>") + "</plist>"));
     std::string error;
-    EXPECT_FALSE(parsePlist(
-        head + nested("<array>", "</array>", 100000, "<true/>") + "</plist>", &error));
+    EXPECT_FALSE(
+        parsePlist(head + nested("<array>", "</array>", 100000, "<true/>") + "</plist>", &error));
     EXPECT_NE(error.find("nested"), std::string::npos);
 
     // A binary document nested too deeply, made by our own writer.
@@ -167,7 +167,8 @@ TEST(ValueEquality, NumbersCompareByValue) {
 }
 
 TEST(ValueDescription, ReadsLikeTheLogsShowIt) {
-    Value v(Value::Dictionary{{"HighServerVersion", 3}, {"name", "Default Device"},
+    Value v(Value::Dictionary{{"HighServerVersion", 3},
+                              {"name", "Default Device"},
                               {"list", Value(Value::Array{1, "a b"})}});
     EXPECT_EQ(v.description(),
               "{\n    HighServerVersion = 3;\n    list = (\n        1,\n        \"a b\"\n    );\n"

@@ -13,7 +13,7 @@
 namespace qax::test {
 
 class InMemoryPreferenceStore : public PreferenceStore {
-public:
+  public:
     void registerDefaults(const Value::Dictionary& defaults) override;
     std::optional<Value> objectForKey(std::string_view key) override;
     bool setObject(std::string_view key, const Value& value) override;
@@ -23,14 +23,14 @@ public:
     // Whether a value is stored (registered defaults do not count).
     bool hasStoredValue(std::string_view key);
 
-private:
+  private:
     std::mutex mutex_;
     Value::Dictionary defaults_;
     Value::Dictionary stored_;
 };
 
 class FakeDeviceProperties : public DeviceProperties {
-public:
+  public:
     std::optional<Value> copyDeviceProperty(std::string_view name) override;
     bool isInternalBuild() override { return internal; }
 
@@ -38,7 +38,7 @@ public:
 
     bool internal = false;
 
-private:
+  private:
     std::mutex mutex_;
     std::map<std::string, Value, std::less<>> properties_{
         {"SerialNumber", Value("C02TESTSERIAL")},
@@ -48,7 +48,7 @@ private:
 };
 
 class FakeLocaleInfo : public LocaleInfo {
-public:
+  public:
     std::string preferredLocaleIdentifier() override { return identifier; }
     std::optional<std::string> preferredContentSizeCategory() override { return contentSize; }
 

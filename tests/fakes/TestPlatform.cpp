@@ -58,6 +58,8 @@ TestPlatform::TestPlatform() {
     platform->locale = std::make_shared<FakeLocaleInfo>();
 }
 
-TestPlatform::~TestPlatform() { qaxLog().setSink(previousSink_); }
+TestPlatform::~TestPlatform() {
+    qaxLog().setSink(previousSink_);
+}
 
 }  // namespace qax::test

@@ -14,7 +14,7 @@ namespace qax::test {
 
 // A directory under the system's temporary directory, removed with the object.
 class TempDir {
-public:
+  public:
     TempDir();
     ~TempDir();
     TempDir(const TempDir&) = delete;
@@ -22,7 +22,7 @@ public:
     const std::filesystem::path& path() const { return path_; }
     std::string str() const { return path_.string(); }
 
-private:
+  private:
     std::filesystem::path path_;
 };
 
@@ -30,7 +30,7 @@ void writeFile(const std::filesystem::path& path, std::string_view content);
 std::string readFile(const std::filesystem::path& path);
 
 class TestPlatform {
-public:
+  public:
     TestPlatform();
     ~TestPlatform();
 
@@ -40,7 +40,7 @@ public:
     std::shared_ptr<CapturingLogSink> log;
     TempDir home;
 
-private:
+  private:
     std::shared_ptr<LogSink> previousSink_;
 };
 

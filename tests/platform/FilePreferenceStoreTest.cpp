@@ -16,7 +16,7 @@ using test::TestPlatform;
 using test::writeFile;
 
 class FilePreferenceStoreTest : public ::testing::Test {
-protected:
+  protected:
     TestPlatform env;  // temporary HOME and a capturing log
     std::string path = FilePreferenceStore::domainPath(env.home.str());
 };
@@ -63,12 +63,9 @@ TEST_F(FilePreferenceStoreTest, TypedReadsOfAbsentAndPresentKeys) {
         std::int64_t asInt;
         double asDouble;
     } rows[] = {
-        {"b", Value(true), true, 1, 1.0},
-        {"i", Value(2), true, 2, 2.0},
-        {"r", Value(2.75), true, 2, 2.75},
-        {"s", Value("12.5"), true, 12, 12.5},
-        {"yes", Value("YES"), true, 0, 0.0},
-        {"zero", Value(0), false, 0, 0.0},
+        {"b", Value(true), true, 1, 1.0},    {"i", Value(2), true, 2, 2.0},
+        {"r", Value(2.75), true, 2, 2.75},   {"s", Value("12.5"), true, 12, 12.5},
+        {"yes", Value("YES"), true, 0, 0.0}, {"zero", Value(0), false, 0, 0.0},
     };
     for (const auto& r : rows) {
         ASSERT_TRUE(store.setObject(r.key, r.stored));

@@ -47,9 +47,8 @@ TEST(HostDevicePropertiesTest, DevicePlistWithHostFallbacks) {
     EXPECT_FALSE(props.copyDeviceProperty("SerialNumber"));
     EXPECT_FALSE(props.isInternalBuild());
 
-    auto device = toXmlPlist(Value(Value::Dictionary{{"SerialNumber", "C02DEMO"},
-                                                     {"ProductType", "Model9,1"},
-                                                     {"InternalBuild", true}}));
+    auto device = toXmlPlist(Value(Value::Dictionary{
+        {"SerialNumber", "C02DEMO"}, {"ProductType", "Model9,1"}, {"InternalBuild", true}}));
     writeFile(root.path() / "device.plist", *device);
     EXPECT_EQ(props.copyDeviceProperty("SerialNumber"), Value("C02DEMO"));
     EXPECT_EQ(props.copyDeviceProperty("ProductType"), Value("Model9,1"));

@@ -33,6 +33,6 @@ bool takeOption(std::vector<std::string>& args, const std::string& option, std::
 
 #define QAXCTL_CONCAT2(a, b) a##b
 #define QAXCTL_CONCAT(a, b) QAXCTL_CONCAT2(a, b)
-#define QAXCTL_COMMAND(...)                                                        \
-    static ::qaxctl::CommandRegistration QAXCTL_CONCAT(qaxctlCommand_, __LINE__)( \
-        ::qaxctl::Command{__VA_ARGS__})
+#define QAXCTL_COMMAND(...)                                            \
+    static ::qaxctl::CommandRegistration QAXCTL_CONCAT(qaxctlCommand_, \
+                                                       __LINE__)(::qaxctl::Command{__VA_ARGS__})

@@ -15,13 +15,13 @@
 namespace qax {
 
 class CachedPlistFile {
-public:
+  public:
     explicit CachedPlistFile(std::string path) : path_(std::move(path)) {}
 
     std::optional<Value> read();
     const std::string& path() const { return path_; }
 
-private:
+  private:
     std::string path_;
     std::mutex mutex_;
     bool loaded_ = false;

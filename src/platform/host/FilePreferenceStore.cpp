@@ -19,7 +19,7 @@ constexpr const char* kDomainFileName = "com.velmora.qaxagent.plist";
 // An advisory lock on a side file, so that the agent and qaxctl never interleave a
 // read-modify-write of the domain file. The lock file is never replaced, unlike the domain.
 class FileLock {
-public:
+  public:
     FileLock(const std::string& path, int operation) {
         std::error_code ec;
         std::filesystem::create_directories(std::filesystem::path(path).parent_path(), ec);
@@ -38,7 +38,7 @@ public:
     FileLock(const FileLock&) = delete;
     FileLock& operator=(const FileLock&) = delete;
 
-private:
+  private:
     int fd_ = -1;
 };
 
@@ -160,7 +160,9 @@ bool FilePreferenceStore::setObject(std::string_view key, const Value& value) {
     return modify(key, &value);
 }
 
-bool FilePreferenceStore::removeObject(std::string_view key) { return modify(key, nullptr); }
+bool FilePreferenceStore::removeObject(std::string_view key) {
+    return modify(key, nullptr);
+}
 
 std::vector<std::string> FilePreferenceStore::allKeys() {
     std::lock_guard lock(mutex_);

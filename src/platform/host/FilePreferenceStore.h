@@ -15,7 +15,7 @@
 namespace qax {
 
 class FilePreferenceStore : public PreferenceStore {
-public:
+  public:
     explicit FilePreferenceStore(std::string path);
 
     void registerDefaults(const Value::Dictionary& defaults) override;
@@ -30,7 +30,7 @@ public:
 
     static std::string domainPath(const std::string& homeDirectory);
 
-private:
+  private:
     struct FileIdentity {
         dev_t dev = 0;
         ino_t ino = 0;

@@ -12,14 +12,14 @@
 namespace qax {
 
 class HostDeviceProperties : public DeviceProperties {
-public:
+  public:
     explicit HostDeviceProperties(const std::string& platformRoot,
                                   std::string osReleasePath = "/etc/os-release");
 
     std::optional<Value> copyDeviceProperty(std::string_view name) override;
     bool isInternalBuild() override;
 
-private:
+  private:
     std::optional<Value> hostFact(std::string_view name) const;
 
     CachedPlistFile file_;

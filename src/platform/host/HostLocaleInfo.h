@@ -8,7 +8,7 @@
 namespace qax {
 
 class HostLocaleInfo : public LocaleInfo {
-public:
+  public:
     std::string preferredLocaleIdentifier() override;
     std::optional<std::string> preferredContentSizeCategory() override;
 

@@ -6,7 +6,7 @@
 namespace qax {
 
 class SystemClock : public Clock {
-public:
+  public:
     Date now() const override;
     int secondsFromGMT(Date at) const override;
 };
