@@ -12,6 +12,8 @@ namespace qax {
 
 enum class ActivityResult : std::int64_t { Finished = 1, Deferred = 2 };
 
+enum class QualityOfService { Background, Utility, Default };
+
 struct ActivityCriteria {
     std::int64_t delaySeconds = 0;
     std::int64_t gracePeriodSeconds = 0;
@@ -26,6 +28,7 @@ class BackgroundActivity {
     virtual const std::string& identifier() const = 0;
     virtual void setPreregistered(bool preregistered) = 0;
     virtual void setRepeats(bool repeats) = 0;
+    virtual void setQualityOfService(QualityOfService qos) = 0;
     virtual void setCriteria(const ActivityCriteria& criteria) = 0;
     // Arms the activity; `handler` runs when it fires and must call its completion once.
     virtual void scheduleWithBlock(
@@ -38,6 +41,8 @@ class BackgroundActivity {
 class BackgroundActivityScheduler {
   public:
     virtual ~BackgroundActivityScheduler() = default;
+    // The activity of this identifier; pre-registered activities come from the launch
+    // configuration with their own criteria.
     virtual std::shared_ptr<BackgroundActivity> activityWithIdentifier(
         const std::string& identifier) = 0;
 };

@@ -55,17 +55,22 @@ inline constexpr const char* kFollowUpRelativePluralDaysFormatKey = "RelativePlu
 // The follow-up service's own target identifier for the settings application.
 inline constexpr const char* kFollowUpSettingsTargetBundleIdentifier = "com.velmora.Preferences";
 
+// Opened per call for a client identifier (the agent's is "com.velmora.Kestova").
 class FollowUpCenter {
   public:
     virtual ~FollowUpCenter() = default;
-    // Posting replaces an item with the same unique identifier. False with `error` set
-    // when the item could not be stored.
+    // Stores an item; an item with the same unique identifier is replaced. False with
+    // `error` set when the item could not be stored.
     virtual bool postFollowUpItem(const std::string& clientIdentifier, const FollowUpItem& item,
                                   std::string* error) = 0;
-    virtual std::vector<FollowUpItem> pendingFollowUpItems(const std::string& clientIdentifier) = 0;
-    virtual bool clearPendingFollowUpItems(const std::string& clientIdentifier,
-                                           const std::vector<std::string>& uniqueIdentifiers,
-                                           std::string* error) = 0;
+    // Removes the pending items with these unique identifiers.
+    virtual bool clearPendingFollowUpItemsWithUniqueIdentifiers(
+        const std::string& clientIdentifier, const std::vector<std::string>& uniqueIdentifiers,
+        std::string* error) = 0;
+    // The items this client has pending; on failure `error` is set and the list may be empty.
+    virtual std::vector<FollowUpItem> pendingFollowUpItems(const std::string& clientIdentifier,
+                                                           std::string* error) = 0;
+    // Withdraws the notification of a pending item, leaving the item itself.
     virtual bool clearNotificationForItem(const std::string& clientIdentifier,
                                           const FollowUpItem& item, std::string* error) = 0;
 };
