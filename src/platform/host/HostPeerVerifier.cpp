@@ -1,9 +1,9 @@
 #include "platform/host/HostPeerVerifier.h"
 
 #include <poll.h>
-#include <sys/pidfd.h>
 #include <sys/socket.h>
 #include <sys/stat.h>
+#include <sys/syscall.h>
 #include <unistd.h>
 
 #include <cerrno>
@@ -23,6 +23,8 @@ struct FdGuard {
         }
     }
 };
+
+int openPidfd(pid_t pid) { return static_cast<int>(::syscall(SYS_pidfd_open, pid, 0)); }
 
 // The effective uid from /proc/PID/status ("Uid: real effective saved fs").
 std::optional<uid_t> effectiveUid(pid_t pid) {
@@ -68,7 +70,7 @@ std::optional<VerifiedPeer> HostPeerVerifier::verify(int socketFd, ApplicationRe
     const auto [pid, uid] = *cred;
 
     // From here on the pidfd names this very process, whatever happens to the pid.
-    FdGuard pidfd{::pidfd_open(pid, 0)};
+    FdGuard pidfd{openPidfd(pid)};
     if (pidfd.fd < 0) {
         return fail("pidfd_open(" + std::to_string(pid) + "): " + std::strerror(errno));
     }

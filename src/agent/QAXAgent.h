@@ -1,0 +1,85 @@
+// The object behind every request: each accepted connection gets its own, start-up keeps one
+// for the monitors, and activities make their own. It reaches warranties and follow-ups only
+// through its warranty provider and devices only through its device provider. Requests run on
+// the caller's thread; the providers may be swapped while requests run (each step uses the
+// provider it reads then, under a small lock). The all-devices join delivers on the agent's
+// own serial queue.
+#pragma once
+
+#include <memory>
+#include <mutex>
+#include <optional>
+#include <string>
+
+#include "agent/QAXAgentProtocol.h"
+#include "agent/QAXAgentWarrantyProvider.h"
+#include "core/JoinCounter.h"
+#include "core/TaskRunner.h"
+#include "devices/QAXAgentDeviceProvider.h"
+#include "platform/ServiceListener.h"
+
+namespace qax {
+
+struct Platform;
+
+class QAXAgent : public QAXAgentProtocol,
+                 public ExportedObject,
+                 public std::enable_shared_from_this<QAXAgent> {
+  public:
+    // The agent of a client or activity. Without an identifier the settings application's is
+    // used. The device provider is the process's shared devices manager.
+    static std::shared_ptr<QAXAgent> initWithCallingProcessBundleID(
+        std::shared_ptr<Platform> platform, std::optional<std::string> callingProcessBundleID);
+    static std::shared_ptr<QAXAgent> initWithWarrantyProvider(
+        std::shared_ptr<Platform> platform,
+        std::shared_ptr<QAXAgentWarrantyProvider> warrantyProvider,
+        std::shared_ptr<QAXAgentDeviceProvider> deviceProvider);
+
+    QAXAgent(std::shared_ptr<Platform> platform,
+             std::shared_ptr<QAXAgentWarrantyProvider> warrantyProvider,
+             std::shared_ptr<QAXAgentDeviceProvider> deviceProvider);
+
+    std::shared_ptr<QAXAgentWarrantyProvider> warrantyProvider() const;
+    void setWarrantyProvider(std::shared_ptr<QAXAgentWarrantyProvider> provider);
+    std::shared_ptr<QAXAgentDeviceProvider> deviceProvider() const;
+    void setDeviceProvider(std::shared_ptr<QAXAgentDeviceProvider> provider);
+    // The process on whose behalf this agent works (set by initWithCallingProcessBundleID).
+    const std::string& callingProcessBundleID() const { return callingProcessBundleID_; }
+
+    // QAXAgentProtocol.
+    void scheduleOutreach(QAXBoolReply reply) override;
+    void scheduleOutreachAfter(double delay, QAXBoolReply reply) override;
+    void velmoraAccountAdded(QAXBoolReply reply) override;
+    void checkIsAvailableInStore(
+        const std::string& bundleIdentifier,
+        std::function<void(std::optional<Value::Dictionary>)> reply) override;
+    void appSupportAvailability(const std::string& argument,
+                                std::function<void(Value::Dictionary)> reply) override;
+    void readWebURLOverride(std::function<void(std::optional<Value>)> reply) override;
+    void defaultDevice(QAXDeviceReply reply) override;
+    void pairedDevices(QAXDeviceListReply reply) override;
+    void getDefaultDeviceInfoUsingPolicy(QAXWarrantyPolicy policy,
+                                         QAXDeviceInfoReply reply) override;
+    void getDeviceInfoForSerialNumber(const std::string& serialNumber, QAXWarrantyPolicy policy,
+                                      QAXDeviceInfoReply reply) override;
+    void getAllDeviceInfosUsingPolicy(QAXWarrantyPolicy policy, bool updateFollowUps,
+                                      QAXDeviceInfoListReply reply) override;
+    void dismissFollowUpForSerialNumber(const std::string& serialNumber,
+                                        QAXBoolReply completion) override;
+    void dismissNotificationForSerialNumber(const std::string& serialNumber,
+                                            QAXBoolReply completion) override;
+
+  private:
+    // Logs that an operation whose collaborators have not joined the agent yet was asked for.
+    static void logUnavailable(const char* operation);
+
+    const std::shared_ptr<Platform> platform_;
+    std::shared_ptr<TaskRunner> policyLookupQueue_;
+    JoinCounter group_;
+    mutable std::mutex providerMutex_;
+    std::shared_ptr<QAXAgentWarrantyProvider> warrantyProvider_;
+    std::shared_ptr<QAXAgentDeviceProvider> deviceProvider_;
+    std::string callingProcessBundleID_;
+};
+
+}  // namespace qax

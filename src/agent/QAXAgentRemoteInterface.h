@@ -1,0 +1,23 @@
+// QAXAgentProtocol as an IPC interface: maps each operation's full keyword name to a call on
+// the exported agent, checking the kind and count of the arguments and archiving the reply.
+// Operations whose implementation has not joined the agent yet answer "unsupported
+// operation"; names outside the protocol answer "unknown operation". Stateless; called on the
+// connection's request queue, replies from wherever the agent finishes.
+#pragma once
+
+#include <memory>
+
+#include "platform/ServiceListener.h"
+
+namespace qax {
+
+class QAXAgentRemoteInterface : public RemoteInterface {
+  public:
+    // The one shared description.
+    static std::shared_ptr<const QAXAgentRemoteInterface> shared();
+
+    void invoke(const std::shared_ptr<ExportedObject>& object, const std::string& op,
+                const Value::Array& args, RemoteReplyHandler reply) const override;
+};
+
+}  // namespace qax
