@@ -124,11 +124,7 @@ Value builtInSummary() {
 
 class Simulator {
   public:
-    explicit Simulator(Options o) : opt_(std::move(o)) {
-        if (!opt_.attestationRoot.empty()) {
-            rootPem_ = qax::readWholeFile(opt_.attestationRoot).value_or("");
-        }
-    }
+    explicit Simulator(Options o) : opt_(std::move(o)) {}
 
     void install(httplib::Server& server) {
         server.Get(kVersionListPath, [this](const httplib::Request& req, httplib::Response& res) {
@@ -194,8 +190,13 @@ class Simulator {
         auto header = [&](const char* name) -> std::optional<std::string> {
             return req.has_header(name) ? std::optional(req.get_header_value(name)) : std::nullopt;
         };
-        auto verdict = checkAttestation(header("X-Velmora-Kva-S"), header("X-Velmora-Kva"),
-                                        req.body, rootPem_);
+        // Read per request: the device creates its attestation CA on first use, possibly
+        // after the simulator started.
+        const std::string rootPem = opt_.attestationRoot.empty()
+                                        ? ""
+                                        : qax::readWholeFile(opt_.attestationRoot).value_or("");
+        auto verdict =
+            checkAttestation(header("X-Velmora-Kva-S"), header("X-Velmora-Kva"), req.body, rootPem);
         notes["attestation"] =
             verdict.present ? (verdict.valid ? "valid" : "invalid: " + verdict.reason) : "absent";
         if (verdict.present && !verdict.valid) {
@@ -235,7 +236,6 @@ class Simulator {
     }
 
     Options opt_;
-    std::string rootPem_;
     std::mutex logMutex_;
 };
 
