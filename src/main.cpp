@@ -8,6 +8,7 @@
 #include <memory>
 
 #include "agent/QAXAgent.h"
+#include "agent/QAXAgentRemoteInterface.h"
 #include "agent/QAXLaunchEventHandler.h"
 #include "agent/ServiceDelegate.h"
 #include "core/AsioDispatcher.h"
@@ -20,7 +21,6 @@
 
 namespace {
 
-constexpr const char* kServiceName = "com.velmora.qaxagent";
 constexpr const char* kStartupCallingProcess = "com.velmora.Preferences";
 
 }  // namespace
@@ -71,7 +71,7 @@ int main() {
 
     // 8.
     auto delegate = std::make_shared<ServiceDelegate>(platform);
-    auto listener = platform->ipc->makeListener(kServiceName);
+    auto listener = platform->ipc->makeListener(kQAXAgentServiceName);
     if (!listener) {
         return 1;
     }

@@ -11,6 +11,9 @@
 
 namespace qax {
 
+// The IPC service name under which the agent publishes this interface.
+inline constexpr const char* kQAXAgentServiceName = "com.velmora.qaxagent";
+
 class QAXAgentRemoteInterface : public RemoteInterface {
   public:
     // The one shared description.
