@@ -1,0 +1,335 @@
+#include "signing/AccountHeaders.h"
+
+#include <gtest/gtest.h>
+
+#include <regex>
+
+#include "core/Hash.h"
+#include "core/JsonCodec.h"
+#include "fakes/FakeAccounts.h"
+#include "fakes/FakeServices.h"
+#include "fakes/TestPlatform.h"
+#include "platform/HttpClient.h"
+#include "platform/PreferenceStore.h"
+
+namespace qax {
+namespace {
+
+using test::FakeAccountStore;
+using test::FakeIdentityAccountManager;
+
+constexpr const char* kNoTokenAfterRenewal =
+    "Error: still no KF token even after calling renewCredentialsForAccount.";
+
+class AccountHeadersTest : public ::testing::Test {
+  protected:
+    AccountHeadersTest() {
+        accounts = std::make_shared<FakeAccountStore>();
+        tp.platform->accounts = accounts;
+        tp.platform->identity = std::make_shared<FakeIdentityAccountManager>();
+    }
+
+    bool sign(bool force = false, std::optional<std::string> bundleID = "com.velmora.Preferences") {
+        return qax_signWithAccountHeaders(request, *tp.platform, force, true, bundleID);
+    }
+
+    test::TestPlatform tp;
+    std::shared_ptr<FakeAccountStore> accounts;
+    HttpRequest request{"https://coverage.example/api/v3/coverage/summary", 30};
+};
+
+TEST_F(AccountHeadersTest, SignedRequestCarriesEveryHeaderInOrder) {
+    ASSERT_TRUE(sign());
+    std::vector<std::pair<std::string, std::string>> expected{
+        {"X-Velmora-KF-Token", "stored-token"},
+        {"X-Fake-Client-Info", "client-info"},
+        {"X-Fake-UDID", "device-udid"},
+        {"X-Fake-Identity", "identity-value"},
+        {"altDSID", "primary-altdsid"},
+        {"User-Agent", "<com.velmora.Preferences/4.2/Model9,1>"},
+        {"storefrontLocale", "143441-1,29"},
+    };
+    EXPECT_EQ(request.headers(), expected);
+    EXPECT_TRUE(accounts->renewals().empty());
+    EXPECT_TRUE(tp.log->contains("storeLocale 143441-1,29"));
+    // Signing alone sets neither method nor body.
+    EXPECT_EQ(request.method(), "GET");
+    EXPECT_FALSE(request.body());
+}
+
+TEST_F(AccountHeadersTest, UserAgentWithoutBundleIdentifierNamesTheAgent) {
+    ASSERT_TRUE(sign(false, std::nullopt));
+    EXPECT_EQ(request.valueForHeader("User-Agent"), "<com.velmora.qaxagent/4.2/Model9,1>");
+    ASSERT_TRUE(qax_signWithAccountHeaders(request, *tp.platform, false, false));
+    EXPECT_EQ(request.valueForHeader("User-Agent"), _userAgent(*tp.platform));
+}
+
+TEST_F(AccountHeadersTest, MissingAccountsRefuseToSignAndLeaveTheRequestUntouched) {
+    struct Row {
+        const char* name;
+        std::function<void(FakeAccountStore&)> setUp;
+        std::vector<std::string> messages;
+    } rows[] = {
+        {"no primary account",
+         [](FakeAccountStore& a) { a.primary = nullptr; },
+         {"No primary Skyvault account, can't sign this request"}},
+        {"no KF account",
+         [](FakeAccountStore& a) { a.kf = nullptr; },
+         {"Keyforge signing failed because no KF account was provided.",
+          "Failed to add KF headers, can't sign this request"}},
+        {"KF account without altDSID",
+         [](FakeAccountStore& a) { a.kf = std::make_shared<Account>(); },
+         {"Keyforge signing failed because no there's no altDSID on the account.",
+          "Failed to add KF headers, can't sign this request"}},
+    };
+    for (const auto& row : rows) {
+        SCOPED_TRACE(row.name);
+        test::TestPlatform local;
+        auto store = std::make_shared<FakeAccountStore>();
+        row.setUp(*store);
+        local.platform->accounts = store;
+        local.platform->identity = std::make_shared<FakeIdentityAccountManager>();
+        HttpRequest r("https://coverage.example/");
+        EXPECT_FALSE(qax_signWithAccountHeaders(r, *local.platform, true, true, "b"));
+        EXPECT_TRUE(r.headers().empty());
+        EXPECT_EQ(local.log->messages(), row.messages);
+        EXPECT_TRUE(store->renewals().empty());
+    }
+}
+
+TEST_F(AccountHeadersTest, TokenRenewal) {
+    struct Row {
+        const char* name;
+        std::optional<std::string> stored;
+        bool force;
+        FakeAccountStore::Renewal renewal;
+        bool signs;
+        std::optional<std::string> header;
+        std::size_t renewals;
+        std::vector<std::string> messages;
+    } rows[] = {
+        {"stored token, not forced: no renewal", "old", false, {}, true, "old", 0, {}},
+        {"forced renewal succeeds",
+         "old",
+         true,
+         {0, std::nullopt, "new"},
+         true,
+         "new",
+         1,
+         {"Reprovision KF tokens"}},
+        {"forced renewal fails: the previous token stays",
+         "old",
+         true,
+         {7, "offline", std::nullopt},
+         true,
+         "old",
+         1,
+         {"Reprovision KF tokens",
+          "No way to sign request with KF token because renewal of KF credential failed: 7, "
+          "offline"}},
+        {"no token, renewal succeeds",
+         std::nullopt,
+         false,
+         {0, std::nullopt, "new"},
+         true,
+         "new",
+         1,
+         {"Reprovision KF tokens"}},
+        {"no token, renewal yields no token",
+         std::nullopt,
+         false,
+         {0, std::nullopt, std::nullopt},
+         false,
+         std::nullopt,
+         1,
+         {"Reprovision KF tokens", kNoTokenAfterRenewal}},
+        {"no token, renewal fails",
+         std::nullopt,
+         false,
+         {-3, std::nullopt, std::nullopt},
+         false,
+         std::nullopt,
+         1,
+         {"Reprovision KF tokens",
+          "No way to sign request with KF token because renewal of KF credential failed: -3, "
+          "(null)",
+          kNoTokenAfterRenewal}},
+    };
+    for (const auto& row : rows) {
+        SCOPED_TRACE(row.name);
+        test::TestPlatform local;
+        FakeAccountStore store;
+        store.setToken(row.stored);
+        store.renewal = row.renewal;
+        HttpRequest r("https://coverage.example/");
+        EXPECT_EQ(_addKFHeadersForAccount(r, *store.primary, store, row.force, true), row.signs);
+        EXPECT_EQ(r.valueForHeader("X-Velmora-KF-Token"), row.header);
+        EXPECT_EQ(local.log->messages(), row.messages);
+        auto renewals = store.renewals();
+        ASSERT_EQ(renewals.size(), row.renewals);
+        for (const auto& options : renewals) {
+            EXPECT_TRUE(options.avoidUserInterface);
+            EXPECT_EQ(options.services, std::vector<std::string>{"com.velmora.kf.supportapp.auth"});
+        }
+    }
+}
+
+TEST_F(AccountHeadersTest, StoreFront) {
+    struct Row {
+        const char* name;
+        std::optional<Value> preference;
+        bool ostara;
+        std::optional<std::string> silentStorefront;
+        std::optional<std::string> header;
+        int ostaraLookups;
+        std::size_t silentCalls;
+        const char* message;
+    } rows[] = {
+        {"preference overrides everything", Value("override-front"), true, "silent",
+         "override-front", 0, 0, nullptr},
+        {"a number in the preference is sent as text", Value(143441), true, std::nullopt, "143441",
+         0, 0, nullptr},
+        {"store account", std::nullopt, true, "silent", "143441-1,29", 1, 0, nullptr},
+        {"silent authentication", std::nullopt, false, "silent-front", "silent-front", 1, 1,
+         "Couldn't find an OstaraAccount"},
+        {"silent authentication fails", std::nullopt, false, std::nullopt, std::nullopt, 1, 1,
+         "Couldn't find an OstaraAccount with error: silent authentication failed"},
+    };
+    for (const auto& row : rows) {
+        SCOPED_TRACE(row.name);
+        test::TestPlatform local;
+        auto store = std::make_shared<FakeAccountStore>();
+        if (!row.ostara) {
+            store->ostara = nullptr;
+        }
+        if (row.silentStorefront) {
+            store->silentAccount =
+                std::make_shared<Account>(Account{std::nullopt, row.silentStorefront, 1});
+        }
+        if (row.preference) {
+            local.platform->preferences->setObject("storefrontLocale", *row.preference);
+        }
+        local.platform->accounts = store;
+        local.platform->identity = std::make_shared<FakeIdentityAccountManager>();
+        HttpRequest r("https://coverage.example/");
+        ASSERT_TRUE(qax_signWithAccountHeaders(r, *local.platform, false, true, "b"));
+        EXPECT_EQ(r.valueForHeader("storefrontLocale"), row.header);
+        EXPECT_EQ(store->ostaraLookups(), row.ostaraLookups);
+        auto reasons = store->silentReasons();
+        EXPECT_EQ(reasons.size(), row.silentCalls);
+        for (const auto& reason : reasons) {
+            EXPECT_EQ(reason,
+                      "Retrying with silent authentication to get the ostara store account.");
+        }
+        if (row.message) {
+            EXPECT_TRUE(local.log->contains(row.message));
+        }
+        EXPECT_TRUE(local.log->contains("storeLocale " + row.header.value_or("(null)")));
+    }
+}
+
+TEST_F(AccountHeadersTest, CoverageBody) {
+    struct Row {
+        double now;
+        int secondsFromGMT;
+        std::uint64_t timestamp;
+        int timezone;
+    } rows[] = {
+        {1700000000.9999, 0, 1700000000999ULL, 0},
+        {1700000000.0, 5 * 3600 + 1800, 1700000000000ULL, 5},      // +5:30
+        {1700000000.0, -(3 * 3600 + 1800), 1700000000000ULL, -3},  // -3:30
+        {1700000000.0, 5 * 3600 + 2700, 1700000000000ULL, 5},      // +5:45
+        {1700000000.0, -(9 * 3600 + 1800), 1700000000000ULL, -9},  // -9:30
+        {1700000000.5, -8 * 3600, 1700000000500ULL, -8},
+    };
+    for (const auto& row : rows) {
+        SCOPED_TRACE(row.secondsFromGMT);
+        tp.clock->set(Date(row.now));
+        tp.clock->setSecondsFromGMT(row.secondsFromGMT);
+        HttpRequest r("https://coverage.example/");
+        qax_setCoverageRequestBodyWithSerialNumber(r, *tp.platform, "C02SERIAL");
+        EXPECT_EQ(r.method(), "POST");
+        EXPECT_EQ(r.valueForHeader("Content-Type"), "application/json");
+        ASSERT_TRUE(r.body());
+        EXPECT_EQ(r.body()->find_first_of(" \n\t"), std::string::npos) << *r.body();
+        auto json = parseJson(*r.body());
+        ASSERT_TRUE(json && json->isDictionary());
+        EXPECT_EQ(json->size(), 4u);
+        EXPECT_EQ(*json->find("serialNumber"), Value("C02SERIAL"));
+        EXPECT_EQ(*json->find("locale"), Value("en_US"));
+        ASSERT_TRUE(json->find("requestTimestamp")->isInteger());
+        EXPECT_EQ(json->find("requestTimestamp")->asInteger(),
+                  static_cast<std::int64_t>(row.timestamp));
+        ASSERT_TRUE(json->find("requestTimezone")->isInteger());
+        EXPECT_EQ(json->find("requestTimezone")->asInteger(), row.timezone);
+        EXPECT_EQ(bodyDescription(r), *r.body());
+    }
+}
+
+TEST_F(AccountHeadersTest, OfferServiceHeaders) {
+    HttpRequest first("https://offers.example/"), second("https://offers.example/");
+    qax_addOASHeadersWithOfferID(first, *tp.platform, "OFFER-1", "C02SERIAL");
+    qax_addOASHeadersWithOfferID(second, *tp.platform, "OFFER-1", "C02SERIAL");
+
+    EXPECT_EQ(first.valueForHeader("X-Velmora-SN"), "C02SERIAL");
+    auto locale = std::static_pointer_cast<test::FakeLocaleInfo>(tp.platform->locale);
+    ASSERT_TRUE(locale->contentSize);
+    EXPECT_EQ(first.valueForHeader("X-Velmora-Content-Size"), locale->contentSize);
+    EXPECT_EQ(first.valueForHeader("X-Velmora-DM"), "No");
+    EXPECT_EQ(first.valueForHeader("User-Agent"), "<com.velmora.qaxagent/4.2/Model9,1>");
+    EXPECT_EQ(first.valueForHeader("Offer-ID"), "OFFER-1");
+    EXPECT_EQ(first.valueForHeader("storefrontLocale"), "143441-1,29");
+    const std::regex uuid("[0-9A-F]{8}-[0-9A-F]{4}-4[0-9A-F]{3}-[89AB][0-9A-F]{3}-[0-9A-F]{12}");
+    auto id1 = first.valueForHeader("X-Velmora-Txn-ID").value_or("");
+    auto id2 = second.valueForHeader("X-Velmora-Txn-ID").value_or("");
+    EXPECT_TRUE(std::regex_match(id1, uuid)) << id1;
+    EXPECT_TRUE(std::regex_match(id2, uuid)) << id2;
+    EXPECT_NE(id1, id2);
+    EXPECT_EQ(first.method(), "GET");
+    EXPECT_FALSE(first.body());
+    EXPECT_FALSE(first.valueForHeader("X-Velmora-KF-Token"));
+
+    // Without a primary account the store front is missing, the rest is still set, and no
+    // silent authentication is tried.
+    accounts->primary = nullptr;
+    locale->contentSize.reset();
+    HttpRequest third("https://offers.example/");
+    qax_addOASHeadersWithOfferID(third, *tp.platform, "OFFER-2", "C02SERIAL");
+    EXPECT_TRUE(tp.log->contains("Primary Skyvault Account is nil!"));
+    EXPECT_FALSE(third.valueForHeader("storefrontLocale"));
+    EXPECT_FALSE(third.valueForHeader("X-Velmora-Content-Size"));
+    EXPECT_EQ(third.valueForHeader("Offer-ID"), "OFFER-2");
+    EXPECT_TRUE(accounts->silentReasons().empty());
+}
+
+TEST_F(AccountHeadersTest, Descriptions) {
+    HttpRequest r("https://coverage.example/");
+    EXPECT_FALSE(bodyDescription(r));
+    r.setBody(std::string("\xC3\x28", 2));
+    EXPECT_FALSE(bodyDescription(r)) << "invalid UTF-8";
+    r.setBody(std::string("caf\xC3\xA9"));
+    EXPECT_EQ(bodyDescription(r), "caf\xC3\xA9");
+
+    r.setValue("B-Header", std::string("2"));
+    r.setValue("A-Header", std::string("1"));
+    EXPECT_EQ(headerDescription(r),
+              (Value(Value::Dictionary{{"A-Header", "1"}, {"B-Header", "2"}}).description()));
+}
+
+TEST(SHA256HashTest, KnownDigests) {
+    struct Row {
+        std::string text;
+        const char* digest;
+    } rows[] = {
+        {"", "e3b0c44298fc1c149afbf4c8996fb92427ae41e4649b934ca495991b7852b855"},
+        {"abc", "ba7816bf8f01cfea414140de5dae2223b00361a396177a9cb410ff61f20015ad"},
+        {std::string("abc\0def", 7),
+         "ba7816bf8f01cfea414140de5dae2223b00361a396177a9cb410ff61f20015ad"},
+    };
+    for (const auto& row : rows) {
+        EXPECT_EQ(sha256Hash(row.text), row.digest);
+    }
+}
+
+}  // namespace
+}  // namespace qax
