@@ -8,9 +8,12 @@
 
 #include "platform/host/CurlHttpClient.h"
 #include "platform/host/FilePreferenceStore.h"
+#include "platform/host/HostAccountStore.h"
 #include "platform/host/HostApplicationRegistry.h"
+#include "platform/host/HostAttestationService.h"
 #include "platform/host/HostDeviceProperties.h"
 #include "platform/host/HostFeatureFlags.h"
+#include "platform/host/HostIdentityAccountManager.h"
 #include "platform/host/HostLaunchEventStream.h"
 #include "platform/host/HostLocaleInfo.h"
 #include "platform/host/HostNotificationSocket.h"
@@ -61,6 +64,11 @@ std::shared_ptr<Platform> makeHostPlatform(const HostEnvironment& environment,
     // Further host bindings are installed here, one line each.
     p->pairedDevices = std::make_shared<HostPairedDeviceRegistry>(p->platformRoot);
     p->featureFlags = std::make_shared<HostFeatureFlags>(p->platformRoot);
+    p->accounts = std::make_shared<HostAccountStore>(p->platformRoot, p->http, p->dispatcher);
+    p->identity =
+        std::make_shared<HostIdentityAccountManager>(p->platformRoot, p->deviceProperties);
+    p->attestation =
+        std::make_shared<HostAttestationService>(p->platformRoot, p->deviceProperties, p->clock);
     p->applications = std::make_shared<HostApplicationRegistry>(p->platformRoot);
     p->processes = std::make_shared<HostProcessBundleLookup>(p->applications);
     p->ipc = std::make_shared<HostServiceListenerFactory>(p->runtimeDirectory, p->dispatcher,
