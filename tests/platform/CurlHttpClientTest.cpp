@@ -1,0 +1,295 @@
+#include "platform/host/CurlHttpClient.h"
+
+#include <gtest/gtest.h>
+
+#include <atomic>
+#include <chrono>
+#include <condition_variable>
+#include <future>
+#include <mutex>
+#include <set>
+#include <thread>
+
+#include "fakes/TestHttpsServer.h"
+#include "fakes/TestPlatform.h"
+
+namespace qax {
+namespace {
+
+using namespace std::chrono_literals;
+using test::TestHttpsServer;
+
+// Holds handlers until the test lets them go (or a safety limit passes).
+class Gate {
+  public:
+    void arrive() {
+        std::unique_lock<std::mutex> lock(mutex_);
+        ++inFlight_;
+        maxInFlight_ = std::max(maxInFlight_, inFlight_);
+        changed_.notify_all();
+    }
+    void waitForRelease(int untilInFlight = 1 << 30) {
+        std::unique_lock<std::mutex> lock(mutex_);
+        changed_.wait_for(lock, 10s, [&] { return released_ || inFlight_ >= untilInFlight; });
+        // Once the threshold is met the gate stays open for the others woken with us.
+        released_ = true;
+        changed_.notify_all();
+        --inFlight_;
+    }
+    bool waitForInFlight(int n) {
+        std::unique_lock<std::mutex> lock(mutex_);
+        return changed_.wait_for(lock, 10s, [&] { return inFlight_ >= n; });
+    }
+    void release() {
+        std::lock_guard<std::mutex> lock(mutex_);
+        released_ = true;
+        changed_.notify_all();
+    }
+    int maxInFlight() {
+        std::lock_guard<std::mutex> lock(mutex_);
+        return maxInFlight_;
+    }
+
+  private:
+    std::mutex mutex_;
+    std::condition_variable changed_;
+    int inFlight_ = 0;
+    int maxInFlight_ = 0;
+    bool released_ = false;
+};
+
+CurlHttpClient::Options trusting(const TestHttpsServer& server) {
+    CurlHttpClient::Options options;
+    options.extraCAFile = server.caFile();
+    return options;
+}
+
+HttpResult sendAndWait(HttpClient& client, const HttpRequest& request) {
+    auto promise = std::make_shared<std::promise<HttpResult>>();
+    auto future = promise->get_future();
+    client.send(request, [promise](HttpResult r) { promise->set_value(std::move(r)); });
+    if (future.wait_for(20s) != std::future_status::ready) {
+        ADD_FAILURE() << "no completion for " << request.url();
+        return HttpResult{std::nullopt, "test timed out"};
+    }
+    return future.get();
+}
+
+std::optional<std::string> responseHeader(const HttpResult& r, const std::string& name) {
+    for (const auto& [n, v] : r.response->headers) {
+        if (strcasecmp(n.c_str(), name.c_str()) == 0) {
+            return v;
+        }
+    }
+    return std::nullopt;
+}
+
+TEST(CurlHttpClientTest, GetAndPostCarryMethodHeadersAndBody) {
+    TestHttpsServer server;
+    server.server().Get("/echo", [](const httplib::Request& req, httplib::Response& res) {
+        res.set_header("X-Reply", "yes");
+        res.set_content("GET|" + req.get_header_value("X-Test"), "text/plain");
+    });
+    server.server().Post("/echo", [](const httplib::Request& req, httplib::Response& res) {
+        res.status = 201;
+        res.set_content("POST|" + req.get_header_value("X-Test") + "|" +
+                            req.get_header_value("Content-Type") + "|" + req.body,
+                        "text/plain");
+    });
+    server.start();
+    CurlHttpClient client(trusting(server));
+
+    HttpRequest get(server.url("/echo"));
+    get.setValue("X-Test", "one");
+    auto got = sendAndWait(client, get);
+    ASSERT_TRUE(got.response) << got.error;
+    EXPECT_EQ(got.response->statusCode, 200);
+    EXPECT_EQ(got.response->body, "GET|one");
+    EXPECT_EQ(responseHeader(got, "x-reply"), "yes");
+
+    HttpRequest post(server.url("/echo"), 5);
+    post.setMethod("POST");
+    post.setValue("X-Test", "two");
+    post.setValue("Content-Type", "application/json");
+    post.setBody(std::string(4000, 'b'));  // large enough that an "Expect" wait would show
+    auto posted = sendAndWait(client, post);
+    ASSERT_TRUE(posted.response) << posted.error;
+    EXPECT_EQ(posted.response->statusCode, 201);
+    EXPECT_EQ(posted.response->body, "POST|two|application/json|" + std::string(4000, 'b'));
+}
+
+TEST(CurlHttpClientTest, RunsTransfersConcurrentlyAndCompletesEachOnceOnTheSessionThread) {
+    constexpr int kTransfers = 6;
+    Gate gate;  // outlives the server's handler threads
+    TestHttpsServer server;
+    server.server().Get("/hold", [&gate](const httplib::Request&, httplib::Response& res) {
+        gate.arrive();
+        // Answers only once every transfer is in flight at the same time.
+        gate.waitForRelease(kTransfers);
+        res.set_content("held", "text/plain");
+    });
+    server.start();
+    CurlHttpClient client(trusting(server));
+
+    std::mutex mutex;
+    std::condition_variable done;
+    int completions = 0;
+    std::set<std::thread::id> threads;
+    for (int i = 0; i < kTransfers; ++i) {
+        client.send(HttpRequest(server.url("/hold")), [&](HttpResult r) {
+            std::lock_guard<std::mutex> lock(mutex);
+            EXPECT_TRUE(r.response) << r.error;
+            threads.insert(std::this_thread::get_id());
+            ++completions;
+            done.notify_all();
+        });
+    }
+    std::unique_lock<std::mutex> lock(mutex);
+    ASSERT_TRUE(done.wait_for(lock, 20s, [&] { return completions == kTransfers; }));
+    EXPECT_EQ(gate.maxInFlight(), kTransfers);
+    EXPECT_EQ(threads.size(), 1u);
+    EXPECT_FALSE(threads.contains(std::this_thread::get_id()));
+}
+
+TEST(CurlHttpClientTest, TransportFailuresComeBackAsErrors) {
+    Gate gate;  // outlives the server's handler threads
+    TestHttpsServer server;
+    server.server().Get("/ok", [](const httplib::Request&, httplib::Response& res) {
+        res.set_content("ok", "text/plain");
+    });
+    server.server().Get("/slow", [&gate](const httplib::Request&, httplib::Response& res) {
+        gate.arrive();
+        gate.waitForRelease();
+        res.set_content("late", "text/plain");
+    });
+    server.start();
+    TestHttpsServer stranger;  // its CA did not issue the server's certificate
+
+    test::TempDir root;
+    server.trustIn(root.str());
+    test::TempDir relativeRoot;
+    std::filesystem::copy_file(server.caFile(), relativeRoot.path() / "ca.pem");
+    test::writeFile(relativeRoot.path() / "tls.plist",
+                    "<?xml version=\"1.0\" encoding=\"UTF-8\"?><plist version=\"1.0\"><dict>"
+                    "<key>ExtraCAFile</key><string>ca.pem</string></dict></plist>");
+    test::TempDir emptyRoot;
+
+    struct Case {
+        const char* name;
+        CurlHttpClient::Options options;
+        std::string url;
+        double timeout;
+        bool succeeds;
+        const char* errorFragment;
+    };
+    CurlHttpClient::Options strangerCA;
+    strangerCA.extraCAFile = stranger.caFile();
+    const Case cases[] = {
+        {"tls.plist names the CA", CurlHttpClient::optionsForPlatformRoot(root.str()),
+         server.url("/ok"), 10, true, ""},
+        {"tls.plist names the CA relative to the root",
+         CurlHttpClient::optionsForPlatformRoot(relativeRoot.str()), server.url("/ok"), 10, true,
+         ""},
+        {"system CAs only", CurlHttpClient::optionsForPlatformRoot(emptyRoot.str()),
+         server.url("/ok"), 10, false, "SSL"},
+        {"another CA", strangerCA, server.url("/ok"), 10, false, "SSL"},
+        {"nothing listens", trusting(server),
+         "https://127.0.0.1:" + std::to_string(test::unusedLocalPort()) + "/ok", 10, false,
+         "connect"},
+        {"time-out", trusting(server), server.url("/slow"), 0.3, false, "Timeout"},
+        {"not a URL", trusting(server), "not a url at all", 10, false, ""},
+    };
+    for (const auto& c : cases) {
+        SCOPED_TRACE(c.name);
+        CurlHttpClient client(c.options);
+        auto result = sendAndWait(client, HttpRequest(c.url, c.timeout));
+        EXPECT_EQ(result.response.has_value(), c.succeeds) << result.error;
+        EXPECT_EQ(result.error.empty(), c.succeeds) << result.error;
+        EXPECT_NE(result.error.find(c.errorFragment), std::string::npos) << result.error;
+    }
+    gate.release();
+}
+
+TEST(CurlHttpClientTest, CachesGetAnswersThatAllowItUnlessTheRequestIgnoresTheCache) {
+    TestHttpsServer server;
+    std::atomic<int> cachedHits{0}, noStoreHits{0};
+    server.server().Get("/cached", [&](const httplib::Request&, httplib::Response& res) {
+        res.set_header("Cache-Control", "public, max-age=60");
+        res.set_content("answer " + std::to_string(++cachedHits), "text/plain");
+    });
+    server.server().Post("/cached", [&](const httplib::Request&, httplib::Response& res) {
+        res.set_header("Cache-Control", "max-age=60");
+        res.set_content("posted " + std::to_string(++cachedHits), "text/plain");
+    });
+    server.server().Get("/nostore", [&](const httplib::Request&, httplib::Response& res) {
+        res.set_header("Cache-Control", "no-store, max-age=60");
+        res.set_content("fresh " + std::to_string(++noStoreHits), "text/plain");
+    });
+    server.start();
+    auto clock = std::make_shared<ManualClock>();
+    auto options = trusting(server);
+    options.clock = clock;
+    CurlHttpClient client(options);
+
+    auto body = [&](const std::string& path, bool ignoreCache, const char* method = "GET") {
+        HttpRequest r(server.url(path));
+        r.setIgnoresLocalCache(ignoreCache);
+        r.setMethod(method);
+        auto result = sendAndWait(client, r);
+        return result.response ? result.response->body : "error: " + result.error;
+    };
+    EXPECT_EQ(body("/cached", false), "answer 1");
+    EXPECT_EQ(body("/cached", false), "answer 1");  // from the cache
+    EXPECT_EQ(body("/cached", true), "answer 2");   // bypassed, and stored again
+    EXPECT_EQ(body("/cached", false), "answer 2");
+    clock->advanceBy(61);
+    EXPECT_EQ(body("/cached", false), "answer 3");  // expired
+    EXPECT_EQ(body("/cached", false, "POST"), "posted 4");
+    EXPECT_EQ(body("/cached", false, "POST"), "posted 5");
+    EXPECT_EQ(body("/nostore", false), "fresh 1");
+    EXPECT_EQ(body("/nostore", false), "fresh 2");
+}
+
+TEST(CurlHttpClientTest, DestructionCompletesOutstandingTransfersWithAnError) {
+    Gate gate;  // outlives the server's handler threads
+    TestHttpsServer server;
+    server.server().Get("/hang", [&gate](const httplib::Request&, httplib::Response& res) {
+        gate.arrive();
+        gate.waitForRelease();
+        res.set_content("too late", "text/plain");
+    });
+    server.server().Get("/ok", [](const httplib::Request&, httplib::Response& res) {
+        res.set_content("ok", "text/plain");
+    });
+    server.start();
+
+    std::atomic<int> calls{0}, errors{0};
+    {
+        CurlHttpClient client(trusting(server));
+        for (int i = 0; i < 3; ++i) {
+            client.send(HttpRequest(server.url("/hang")), [&](HttpResult r) {
+                ++calls;
+                errors += (!r.response && !r.error.empty()) ? 1 : 0;
+            });
+        }
+        ASSERT_TRUE(gate.waitForInFlight(3));
+    }
+    EXPECT_EQ(calls.load(), 3);
+    EXPECT_EQ(errors.load(), 3);
+    gate.release();
+
+    // A completion may release the last reference to the client on the session thread.
+    auto holder = std::make_shared<std::shared_ptr<CurlHttpClient>>(
+        std::make_shared<CurlHttpClient>(trusting(server)));
+    std::promise<bool> released;
+    auto future = released.get_future();
+    (*holder)->send(HttpRequest(server.url("/ok")), [holder, &released](HttpResult r) {
+        holder->reset();
+        released.set_value(r.response.has_value());
+    });
+    ASSERT_EQ(future.wait_for(20s), std::future_status::ready);
+    EXPECT_TRUE(future.get());
+}
+
+}  // namespace
+}  // namespace qax
