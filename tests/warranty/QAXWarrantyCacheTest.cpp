@@ -1,0 +1,201 @@
+#include <gtest/gtest.h>
+
+#include <filesystem>
+#include <regex>
+
+#include "core/Hash.h"
+#include "core/PlistCodec.h"
+#include "fakes/FakeServices.h"
+#include "fakes/TestPlatform.h"
+#include "warranty/QAXWarranty.h"
+
+namespace qax {
+namespace {
+
+namespace fs = std::filesystem;
+
+Value summary(const std::string& label) {
+    return Value(Value::Dictionary{
+        {"covered", true},
+        {"coverageEndDate", 1700000000},
+        {"coverageLocalizedLabel", Value(label)},
+        {"featureToggleParameters",
+         Value(Value::Dictionary{{"hvOfferDisplay", true},
+                                 {"hvOfferToggle", Value(Value::Array{"310-260", "311-480"})}})},
+        {"price", 3.5},
+        {"when", Value(Date(1700000123.0))},
+    });
+}
+
+class QAXWarrantyCacheTest : public ::testing::Test {
+  protected:
+    std::shared_ptr<QAXWarranty> make(const Value& dictionary) {
+        return QAXWarranty::initWithDictionary(tp.platform, dictionary);
+    }
+    fs::path cacheDirectory() const {
+        return fs::path(tp.platform->homeDirectory) / "Library" / "Application Support" /
+               "com.velmora.Kestova";
+    }
+
+    test::TestPlatform tp;
+};
+
+TEST_F(QAXWarrantyCacheTest, RoundTripPerSerialNumber) {
+    auto first = make(summary("first"));
+    auto second = make(summary("second"));
+    first->cacheWarranty("SERIAL-1");
+    second->cacheWarranty("SERIAL-2");
+
+    auto read1 = QAXWarranty::cachedWarrantyForSerialNumber(tp.platform, "SERIAL-1");
+    auto read2 = QAXWarranty::cachedWarrantyForSerialNumber(tp.platform, "SERIAL-2");
+    ASSERT_TRUE(read1 && read2);
+    EXPECT_TRUE(read1->isEqual(first.get()));
+    EXPECT_TRUE(read2->isEqual(second.get()));
+    EXPECT_FALSE(read1->isEqual(second.get()));
+    EXPECT_FALSE(QAXWarranty::cachedWarrantyForSerialNumber(tp.platform, "NEVER-CACHED"));
+
+    // Two files named by the digests, written as XML, and nothing else left behind.
+    std::vector<std::string> names;
+    for (const auto& entry : fs::directory_iterator(cacheDirectory())) {
+        names.push_back(entry.path().filename().string());
+    }
+    std::sort(names.begin(), names.end());
+    std::vector<std::string> expected{sha256Hash("SERIAL-1") + "_Warranty.plist",
+                                      sha256Hash("SERIAL-2") + "_Warranty.plist"};
+    std::sort(expected.begin(), expected.end());
+    EXPECT_EQ(names, expected);
+    const std::regex name("[0-9a-f]{64}_Warranty\\.plist");
+    for (const auto& n : names) {
+        EXPECT_TRUE(std::regex_match(n, name)) << n;
+        EXPECT_EQ(test::readFile(cacheDirectory() / n).rfind("<?xml", 0), 0u);
+    }
+
+    const std::string path1 =
+        (cacheDirectory() / (sha256Hash("SERIAL-1") + "_Warranty.plist")).string();
+    EXPECT_TRUE(tp.log->contains("-[QAXWarranty cacheWarranty:] -> " + path1));
+    EXPECT_TRUE(tp.log->contains("+[QAXWarranty cachedWarrantyForSerialNumber:] : warrantyPath : " +
+                                 path1));
+    EXPECT_TRUE(tp.log->contains("+[QAXWarranty warrantyWithDictionary:serialNumber:] : 0"));
+
+    // A later write replaces the file.
+    second->cacheWarranty("SERIAL-1");
+    EXPECT_TRUE(
+        QAXWarranty::cachedWarrantyForSerialNumber(tp.platform, "SERIAL-1")->isEqual(second.get()));
+}
+
+TEST_F(QAXWarrantyCacheTest, WithoutSerialNumberTheLegacyFileIsUsed) {
+    auto record = make(summary("legacy"));
+    record->cache();
+    EXPECT_TRUE(fs::exists(QAXWarranty::_legacyWarrantyPath(*tp.platform)));
+    EXPECT_EQ(QAXWarranty::_legacyWarrantyPath(*tp.platform),
+              (cacheDirectory() / "Warranty.plist").string());
+    EXPECT_EQ(QAXWarranty::_warrantyPathForSerialNumberFormat(*tp.platform),
+              (cacheDirectory() / "%@_Warranty.plist").string());
+    auto read = QAXWarranty::cachedWarrantyForSerialNumber(tp.platform, std::nullopt);
+    ASSERT_TRUE(read);
+    EXPECT_TRUE(read->isEqual(record.get()));
+}
+
+TEST_F(QAXWarrantyCacheTest, FileContentThatIsNoRecord) {
+    const fs::path file = cacheDirectory() / (sha256Hash("S") + "_Warranty.plist");
+    struct Row {
+        const char* name;
+        std::string content;
+        bool record;
+    } rows[] = {
+        {"array root", *toXmlPlist(Value(Value::Array{Value("a")})), false},
+        {"string root", *toXmlPlist(Value("text")), false},
+        {"not a property list", "<html>oops</html>", false},
+        {"empty file", "", false},
+        {"binary dictionary", *toBinaryPlist(summary("binary")), true},
+    };
+    for (const auto& row : rows) {
+        SCOPED_TRACE(row.name);
+        test::writeFile(file, row.content);
+        auto read = QAXWarranty::cachedWarrantyForSerialNumber(tp.platform, "S");
+        EXPECT_EQ(read != nullptr, row.record);
+        if (read) {
+            EXPECT_EQ(read->dictionaryRepresentation(), summary("binary"));
+        }
+    }
+}
+
+TEST_F(QAXWarrantyCacheTest, SummaryHoldingANullKeepsThePreviousFile) {
+    make(summary("good"))->cacheWarranty("S");
+    const fs::path file = cacheDirectory() / (sha256Hash("S") + "_Warranty.plist");
+    const std::string before = test::readFile(file);
+
+    Value withNull = summary("bad");
+    withNull["coverage"] = Value(Value::Dictionary{{"nested", Value(nullptr)}});
+    make(withNull)->cacheWarranty("S");
+    EXPECT_EQ(test::readFile(file), before);
+    EXPECT_EQ(std::distance(fs::directory_iterator(cacheDirectory()), fs::directory_iterator()), 1);
+}
+
+TEST_F(QAXWarrantyCacheTest, LegacyMigration) {
+    const std::string hash = sha256Hash("C02SERIAL");
+    const Value date(Date(1690000000.0));
+    struct Row {
+        const char* name;
+        bool legacyFile;
+        std::optional<Value> lastUpdated, locale, version;
+    } rows[] = {
+        {"no legacy file", false, date, Value("en_US"), Value("2")},
+        {"file and all three keys", true, date, Value("en_US"), Value("2")},
+        {"file and only the version", true, std::nullopt, std::nullopt, Value("2")},
+        {"file and no keys", true, std::nullopt, std::nullopt, std::nullopt},
+    };
+    const char* names[] = {"CachedWarrantyLastUpdatedDate", "CachedWarrantyLocale",
+                           "CachedWarrantyVersion"};
+    for (const auto& row : rows) {
+        SCOPED_TRACE(row.name);
+        test::TestPlatform local;
+        auto& prefs = static_cast<test::InMemoryPreferenceStore&>(*local.platform->preferences);
+        const std::optional<Value>* values[] = {&row.lastUpdated, &row.locale, &row.version};
+        for (int i = 0; i < 3; ++i) {
+            if (*values[i]) {
+                prefs.setObject(names[i], **values[i]);
+            }
+        }
+        auto legacy = QAXWarranty::initWithDictionary(local.platform, summary("legacy"));
+        if (row.legacyFile) {
+            legacy->cache();
+        }
+
+        auto migrated = QAXWarranty::migrateLegacyCachedWarrantyIfNeededForSerialNumber(
+            local.platform, "C02SERIAL");
+        EXPECT_FALSE(fs::exists(QAXWarranty::_legacyWarrantyPath(*local.platform)));
+        if (!row.legacyFile) {
+            EXPECT_FALSE(migrated);
+            EXPECT_FALSE(local.log->contains("Migrating legacy warranty.."));
+            for (int i = 0; i < 3; ++i) {
+                EXPECT_EQ(prefs.objectForKey(names[i]), *values[i]) << "left untouched";
+                EXPECT_FALSE(prefs.hasStoredValue(hash + "_" + names[i]));
+            }
+            continue;
+        }
+        ASSERT_TRUE(migrated);
+        EXPECT_TRUE(migrated->isEqual(legacy.get()));
+        EXPECT_TRUE(local.log->contains("Migrating legacy warranty.."));
+        auto cached = QAXWarranty::cachedWarrantyForSerialNumber(local.platform, "C02SERIAL");
+        ASSERT_TRUE(cached);
+        EXPECT_TRUE(cached->isEqual(legacy.get()));
+        for (int i = 0; i < 3; ++i) {
+            EXPECT_FALSE(prefs.hasStoredValue(names[i]));
+            EXPECT_EQ(prefs.objectForKey(hash + "_" + names[i]), *values[i]);
+        }
+    }
+}
+
+TEST_F(QAXWarrantyCacheTest, AHomeDirectoryWithAPercentSign) {
+    test::TempDir odd;
+    const fs::path home = odd.path() / "100%@home";
+    tp.platform->homeDirectory = home.string();
+    make(summary("x"))->cacheWarranty("S");
+    EXPECT_TRUE(fs::exists(home / "Library" / "Application Support" / "com.velmora.Kestova" /
+                           (sha256Hash("S") + "_Warranty.plist")));
+    EXPECT_TRUE(QAXWarranty::cachedWarrantyForSerialNumber(tp.platform, "S"));
+}
+
+}  // namespace
+}  // namespace qax
