@@ -25,8 +25,9 @@ using DictionaryCompletion = std::function<void(std::optional<Value>)>;
 using SetCompletion = std::function<void(std::optional<QAXVersionSet>)>;
 
 // Fetches with only the HTTP session in hand, so that a retry does not depend on the
-// caller's platform context still being around.
-void fetchDictionary(std::shared_ptr<HttpClient> http, std::optional<std::string> url,
+// caller's platform context still being around. The transfer holds the session weakly: a
+// session being torn down is not kept alive by its own outstanding requests.
+void fetchDictionary(std::weak_ptr<HttpClient> session, std::optional<std::string> url,
                      bool shouldRetry, DictionaryCompletion completion) {
     static constexpr const char* kFetchFailed =
         "Failed to fetch plist data from URL '%@' with error: %@";
@@ -36,6 +37,7 @@ void fetchDictionary(std::shared_ptr<HttpClient> http, std::optional<std::string
         "Incorrect format in response detected from URL '%@'. Response: %@. Aborting without "
         "retry.";
 
+    std::shared_ptr<HttpClient> http = session.lock();
     if (!http || !url || url->empty()) {
         qaxLog().error(kFetchFailed, url, !http ? "no HTTP session" : "no URL");
         completion(std::nullopt);
@@ -44,7 +46,7 @@ void fetchDictionary(std::shared_ptr<HttpClient> http, std::optional<std::string
     HttpRequest request(*url);
     // The second attempt must reach the server: a cached copy is what looked wrong.
     request.setIgnoresLocalCache(!shouldRetry);
-    http->send(request, [http, url, shouldRetry, completion](HttpResult result) mutable {
+    http->send(request, [session, url, shouldRetry, completion](HttpResult result) mutable {
         if (!result.response) {
             qaxLog().error(kFetchFailed, url, result.error);
             completion(std::nullopt);
@@ -63,7 +65,7 @@ void fetchDictionary(std::shared_ptr<HttpClient> http, std::optional<std::string
         }
         if (shouldRetry) {
             qaxLog().error(kRetrying);
-            fetchDictionary(std::move(http), std::move(url), false, std::move(completion));
+            fetchDictionary(std::move(session), std::move(url), false, std::move(completion));
             return;
         }
         qaxLog().error(kAborting, url, *parsed);
