@@ -169,10 +169,10 @@ bool HostClientConnection::handleFrame(const std::string& payload) {
         sendReply(requestId, RemoteReply::failure("no interface is exported"));
         return true;
     }
-    std::function<void(RemoteReply)> reply = [weak = weak_from_this(), requestId](RemoteReply r) {
-        if (auto self = weak.lock()) {
-            self->sendReply(requestId, std::move(r));
-        }
+    // A request keeps its connection alive until it has replied: while reading is paused no
+    // socket operation may be pending, and the connection must not go with them.
+    std::function<void(RemoteReply)> reply = [self = shared_from_this(), requestId](RemoteReply r) {
+        self->sendReply(requestId, std::move(r));
     };
     requestQueue_->post([interface, object, name = *op->asString(),
                          list = args ? *args->asArray() : Value::Array{},
