@@ -11,6 +11,7 @@
 
 #include <atomic>
 #include <chrono>
+#include <future>
 
 #include "core/Base64.h"
 #include "core/JsonCodec.h"
@@ -490,6 +491,31 @@ TEST(HostAttestationServiceTest, PlatformFileControlsSupportAndFirstIssuance) {
     HostAttestationService again(tp.platform->platformRoot, tp.platform->deviceProperties,
                                  tp.clock);
     EXPECT_EQ(again.rootCertificatePEM(nullptr), first);
+}
+
+}  // namespace
+}  // namespace qax
+
+namespace qax {
+namespace {
+
+TEST(HostAttestationServiceTest, LastReferenceDroppedOnItsOwnThread) {
+    test::TestPlatform tp;
+    auto service = std::make_shared<HostAttestationService>(
+        tp.platform->platformRoot, tp.platform->deviceProperties, tp.clock);
+    AttestationOptions options;
+    options.keyStoreLabel = "label";
+    options.validity = 1;
+    auto done = std::make_shared<std::promise<bool>>();
+    AttestationService* raw = service.get();
+    raw->issueClientCertificate(options,
+                                [keep = std::move(service), done](auto key, auto, auto) mutable {
+                                    keep.reset();  // the service goes on its own thread
+                                    done->set_value(key != nullptr);
+                                });
+    auto future = done->get_future();
+    ASSERT_EQ(future.wait_for(std::chrono::seconds(20)), std::future_status::ready);
+    EXPECT_TRUE(future.get());
 }
 
 }  // namespace

@@ -5,6 +5,7 @@
 
 #include <asio/post.hpp>
 #include <filesystem>
+#include <thread>
 
 #include "core/JsonCodec.h"
 #include "core/Value.h"
@@ -213,10 +214,16 @@ struct HostAttestationService::Core {
 HostAttestationService::HostAttestationService(const std::string& platformRoot,
                                                std::shared_ptr<DeviceProperties> deviceProperties,
                                                std::shared_ptr<Clock> clock)
-    : core_(std::make_shared<Core>(platformRoot, std::move(deviceProperties), std::move(clock))) {}
+    : core_(std::make_shared<Core>(platformRoot, std::move(deviceProperties), std::move(clock))),
+      thread_(std::make_shared<HostIoThread>()) {}
 
 HostAttestationService::~HostAttestationService() {
-    thread_.stop();
+    if (thread_->runningInThisThread()) {
+        // A thread cannot join itself: let another stop it once this handler has returned.
+        std::thread([thread = thread_] { thread->stop(); }).detach();
+    } else {
+        thread_->stop();
+    }
 }
 
 bool HostAttestationService::isAttestationSupported() {
@@ -236,8 +243,8 @@ void HostAttestationService::issueClientCertificate(
     std::function<void(std::shared_ptr<AttestationKey>, std::optional<CertificateChain>,
                        std::optional<AttestationError>)>
         completion) {
-    thread_.start();
-    asio::post(thread_.context(), [core = core_, options, completion = std::move(completion)] {
+    thread_->start();
+    asio::post(thread_->context(), [core = core_, options, completion = std::move(completion)] {
         core->issue(options, completion);
     });
 }

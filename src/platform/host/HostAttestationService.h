@@ -2,7 +2,8 @@
 // authority, leaves carrying the device's identifiers, hardware and OS facts as extensions.
 // attestation.plist {Supported, FirstIssuanceErrorCode} can declare the device unsupported
 // or make every first (user-level) attempt fail with the given code. Thread-safe; issuance
-// runs on the service's own thread, where its completions are called.
+// runs on the service's own thread, where its completions are called. Issuances not yet
+// started when the service is destroyed are dropped.
 #pragma once
 
 #include <memory>
@@ -44,7 +45,9 @@ class HostAttestationService : public AttestationService {
   private:
     struct Core;
     std::shared_ptr<Core> core_;
-    HostIoThread thread_;
+    // Shared so that the service may be destroyed on its own thread (by the last holder of
+    // a late completion) without joining itself.
+    std::shared_ptr<HostIoThread> thread_;
 };
 
 }  // namespace qax
