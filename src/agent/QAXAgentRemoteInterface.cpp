@@ -118,11 +118,6 @@ std::string expectedArguments(const Operation& op) {
 
 }  // namespace
 
-std::shared_ptr<const QAXAgentRemoteInterface> QAXAgentRemoteInterface::shared() {
-    static const auto instance = std::make_shared<const QAXAgentRemoteInterface>();
-    return instance;
-}
-
 void QAXAgentRemoteInterface::invoke(const std::shared_ptr<ExportedObject>& object,
                                      const std::string& op, const Value::Array& args,
                                      RemoteReplyHandler reply) const {

@@ -2,7 +2,8 @@
 // the exported agent, checking the kind and count of the arguments and archiving the reply.
 // Operations whose implementation has not joined the agent yet answer "unsupported
 // operation"; names outside the protocol answer "unknown operation". Stateless; called on the
-// connection's request queue, replies from wherever the agent finishes.
+// connection's request queue, replies from wherever the agent finishes; one description may
+// serve every connection.
 #pragma once
 
 #include <memory>
@@ -16,9 +17,6 @@ inline constexpr const char* kQAXAgentServiceName = "com.velmora.qaxagent";
 
 class QAXAgentRemoteInterface : public RemoteInterface {
   public:
-    // The one shared description.
-    static std::shared_ptr<const QAXAgentRemoteInterface> shared();
-
     void invoke(const std::shared_ptr<ExportedObject>& object, const std::string& op,
                 const Value::Array& args, RemoteReplyHandler reply) const override;
 };

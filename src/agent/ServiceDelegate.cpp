@@ -16,6 +16,9 @@ constexpr std::size_t kExecutablePathBufferSize = 4096;
 
 }  // namespace
 
+ServiceDelegate::ServiceDelegate(std::shared_ptr<Platform> platform)
+    : platform_(std::move(platform)), interface_(std::make_shared<QAXAgentRemoteInterface>()) {}
+
 bool ServiceDelegate::entitlementGrants(const std::optional<Value>& value) {
     // Strings ("YES" included), dates and containers never grant; truthy() is false for them.
     return value && value->truthy();
@@ -31,7 +34,7 @@ bool ServiceDelegate::shouldAcceptNewConnection(
     const pid_t pid = connection->peerProcessIdentifier();
     auto bundleIdentifier = _bundleForPID(pid);
     qaxLog().info("connection added from %d with calling process: %@", pid, bundleIdentifier);
-    connection->exportInterface(QAXAgentRemoteInterface::shared());
+    connection->exportInterface(interface_);
     connection->exportObject(QAXAgent::initWithCallingProcessBundleID(platform_, bundleIdentifier));
     connection->resume();
     return true;

@@ -18,7 +18,7 @@ struct Platform;
 
 class ServiceDelegate : public ServiceListenerDelegate {
   public:
-    explicit ServiceDelegate(std::shared_ptr<Platform> platform) : platform_(std::move(platform)) {}
+    explicit ServiceDelegate(std::shared_ptr<Platform> platform);
 
     bool shouldAcceptNewConnection(ServiceListener& listener,
                                    const std::shared_ptr<ClientConnection>& connection) override;
@@ -32,6 +32,8 @@ class ServiceDelegate : public ServiceListenerDelegate {
 
   private:
     const std::shared_ptr<Platform> platform_;
+    // What every accepted connection exports; stateless, so one serves them all.
+    const std::shared_ptr<const RemoteInterface> interface_;
 };
 
 }  // namespace qax

@@ -37,11 +37,10 @@ class QAXAgentRemoteInterfaceTest : public ::testing::Test {
     Outcome invoke(const std::string& op, Value::Array args,
                    std::shared_ptr<ExportedObject> object = nullptr) {
         Outcome out;
-        QAXAgentRemoteInterface::shared()->invoke(object ? object : agent, op, args,
-                                                  [&out](RemoteReply r) {
-                                                      ++out.calls;
-                                                      out.reply = std::move(r);
-                                                  });
+        QAXAgentRemoteInterface().invoke(object ? object : agent, op, args, [&out](RemoteReply r) {
+            ++out.calls;
+            out.reply = std::move(r);
+        });
         return out;
     }
 

@@ -24,7 +24,9 @@ struct FdGuard {
     }
 };
 
-int openPidfd(pid_t pid) { return static_cast<int>(::syscall(SYS_pidfd_open, pid, 0)); }
+int openPidfd(pid_t pid) {
+    return static_cast<int>(::syscall(SYS_pidfd_open, pid, 0));
+}
 
 // The effective uid from /proc/PID/status ("Uid: real effective saved fs").
 std::optional<uid_t> effectiveUid(pid_t pid) {
