@@ -39,6 +39,8 @@ HostNotificationSocket::~HostNotificationSocket() {
         asio::error_code ec;
         receiver_->socket.close(ec);
         ::unlink(receiver_->path.c_str());
+        // The socket must go before the io_context it belongs to, which is a later member.
+        receiver_.reset();
     }
 }
 
