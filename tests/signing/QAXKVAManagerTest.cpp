@@ -506,13 +506,18 @@ TEST(HostAttestationServiceTest, LastReferenceDroppedOnItsOwnThread) {
     AttestationOptions options;
     options.keyStoreLabel = "label";
     options.validity = 1;
+    auto released = std::make_shared<std::promise<void>>();
     auto done = std::make_shared<std::promise<bool>>();
-    AttestationService* raw = service.get();
-    raw->issueClientCertificate(options,
-                                [keep = std::move(service), done](auto key, auto, auto) mutable {
-                                    keep.reset();  // the service goes on its own thread
-                                    done->set_value(key != nullptr);
-                                });
+    // The completion waits until the test has let go, so that its copy is the last one.
+    service->issueClientCertificate(
+        options, [keep = service, released = released->get_future().share(), done](auto key, auto,
+                                                                                   auto) mutable {
+            released.wait();
+            keep.reset();  // the service goes on its own thread
+            done->set_value(key != nullptr);
+        });
+    service.reset();
+    released->set_value();
     auto future = done->get_future();
     ASSERT_EQ(future.wait_for(std::chrono::seconds(20)), std::future_status::ready);
     EXPECT_TRUE(future.get());
