@@ -111,6 +111,8 @@ Value builtInSummary() {
       "hvNotificationLocalizedOfferPluralDescFormat": "%@ days left to add the Haverly plan",
       "hvNotificationLocalizedOfferSingularDesc": "Last day to add the Haverly plan",
       "hvLocalizedOfferCTA": "Add Coverage",
+      "hvLocalizedOfferDetailsPluralEligibilityFormat": "Eligible for %@ more days.",
+      "hvLocalizedOfferDetailsSingularEligibility": "Eligible until the end of today.",
       "featureToggleParameters": {
         "hvOfferDisplay": true, "hvOfferSettingsAppBadge": true, "hvOfferSettingsRowBadge": true,
         "hvOfferDurationDaysBeforeEndDate": 60, "hvOfferToggle": []
