@@ -37,6 +37,7 @@ class AgentProcess {
     // Sends `signal` and waits for the exit; the raw wait status, or -1 if it had to be killed.
     int stop(int signal = 15);
     bool running();
+    pid_t pid() const { return pid_; }
 
     // The agent's stderr so far.
     std::string log() const;
