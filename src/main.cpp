@@ -43,33 +43,33 @@ int main() {
     auto platform = makeHostPlatform(HostEnvironment::fromProcessEnvironment(), dispatcher);
     qaxLog().setSink(platform->log);
 
-    // 1.
+    // Start-up, in order: announce the launch,
     qaxLog().info("launched");
 
-    // 2.
+    // register the default settings,
     qax_registerDefaults(*platform->preferences);
 
-    // 3. The six activity schedulers join here. In this order, each made with
+    // (the six activity schedulers join here. In this order, each made with
     // newSchedulerWithActivityDelegate: for a new activity and told
     // monitorForScheduledActivity before the next is made: QAXPostUpgradeActivity,
     // QAXPostBootActivity, QAXOutreachActivity, QAXFollowUpPost,
-    // QAXConversionOutreachActivity, QAXFollowUpRefresh. They live as long as the process.
+    // QAXConversionOutreachActivity, QAXFollowUpRefresh. They live as long as the process.)
 
-    // 4.
+    // create the start-up agent,
     auto startupAgent = QAXAgent::initWithCallingProcessBundleID(platform, kStartupCallingProcess);
     // The start-up migration joins here: startupAgent->performMigrationIfNeeded(), run
     // synchronously before any client is listened to.
 
-    // 5. The locale monitor joins here: QAXLocaleMonitor initWithAgent: startupAgent, start.
+    // (the locale monitor joins here: QAXLocaleMonitor initWithAgent: startupAgent, start.)
 
-    // 6. The paired-devices monitor joins here: QAXPairedDevicesMonitor initWithAgent:
-    // startupAgent, start. The launch-event handler of step 7 will hold it.
+    // (the paired-devices monitor joins here: QAXPairedDevicesMonitor initWithAgent:
+    // startupAgent, start. The launch-event handler below will hold it.)
 
-    // 7.
+    // install the launch-event handler,
     auto launchEventHandler = std::make_shared<QAXLaunchEventHandler>();
     QAXLaunchEventHandler::install(*platform->launchEvents, launchEventHandler);
 
-    // 8.
+    // listen on the service name,
     auto delegate = std::make_shared<ServiceDelegate>(platform);
     auto listener = platform->ipc->makeListener(kQAXAgentServiceName);
     if (!listener) {
@@ -81,7 +81,7 @@ int main() {
         return 1;
     }
 
-    // 9.
+    // and run the main event loop for the life of the process.
     dispatcher->runMainLoop();
 
     // Close every client, let the aborted socket operations finish so that connections and
