@@ -316,20 +316,5 @@ TEST_F(AccountHeadersTest, Descriptions) {
               (Value(Value::Dictionary{{"A-Header", "1"}, {"B-Header", "2"}}).description()));
 }
 
-TEST(SHA256HashTest, KnownDigests) {
-    struct Row {
-        std::string text;
-        const char* digest;
-    } rows[] = {
-        {"", "e3b0c44298fc1c149afbf4c8996fb92427ae41e4649b934ca495991b7852b855"},
-        {"abc", "ba7816bf8f01cfea414140de5dae2223b00361a396177a9cb410ff61f20015ad"},
-        {std::string("abc\0def", 7),
-         "ba7816bf8f01cfea414140de5dae2223b00361a396177a9cb410ff61f20015ad"},
-    };
-    for (const auto& row : rows) {
-        EXPECT_EQ(sha256Hash(row.text), row.digest);
-    }
-}
-
 }  // namespace
 }  // namespace qax
