@@ -62,6 +62,12 @@ std::shared_ptr<TaskRunner> AsioDispatcher::makeSerialQueue(std::string) {
     return std::make_shared<AsioRunner<Strand>>(asio::make_strand(state_->pool.get_executor()));
 }
 
+AsioDispatcher::IoStrand AsioDispatcher::makeIoStrand() {
+    using Strand = asio::strand<asio::thread_pool::executor_type>;
+    Strand strand = asio::make_strand(state_->pool.get_executor());
+    return {asio::any_io_executor(strand), std::make_shared<AsioRunner<Strand>>(strand)};
+}
+
 asio::io_context& AsioDispatcher::mainContext() {
     return state_->io;
 }

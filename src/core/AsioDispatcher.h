@@ -3,6 +3,7 @@
 // blocking work gets a pool of its own. Thread-safe.
 #pragma once
 
+#include <asio/any_io_executor.hpp>
 #include <memory>
 #include <string>
 
@@ -24,6 +25,14 @@ class AsioDispatcher : public Dispatcher, public std::enable_shared_from_this<As
     std::shared_ptr<TaskRunner> backgroundQueue() override { return background_; }
     std::shared_ptr<TaskRunner> makeSerialQueue(std::string name) override;
     std::shared_ptr<TaskRunner> blockingQueue() override { return blocking_; }
+
+    // A serial queue that I/O objects can also be bound to: socket completions and queued
+    // tasks then run one at a time on the same strand, without hopping between threads.
+    struct IoStrand {
+        asio::any_io_executor executor;
+        std::shared_ptr<TaskRunner> queue;
+    };
+    IoStrand makeIoStrand();
 
     asio::io_context& mainContext();
     // Runs the main queue on the calling thread until stopMainLoop().

@@ -1,9 +1,9 @@
-// One client of the agent's Unix socket. Socket I/O runs on the main io_context (the main
-// thread); requests are handed, one at a time and in arrival order, to the connection's own
-// serial queue, where the exported interface calls the exported object; replies may come from
-// any thread and in any order, and are encoded on the replying thread and written from the
-// main thread. The peer facts and the exported interface and object are set by the listener
-// before resume() and guarded by a mutex.
+// One client of the agent's Unix socket. The socket is bound to the connection's own strand,
+// which is also its request queue: reads, requests (one at a time, in arrival order, where the
+// exported interface calls the exported object) and writes run there, so a request answered
+// at once never changes threads. Replies may come from any thread and in any order; they are
+// encoded on the replying thread and written from the strand. The peer facts and the exported
+// interface and object are set by the listener before resume() and guarded by a mutex.
 #pragma once
 
 #include <sys/types.h>
@@ -27,7 +27,7 @@ class HostClientConnection : public ClientConnection,
   public:
     using Socket = asio::local::stream_protocol::socket;
 
-    // Called on the main thread; `requestQueue` is the connection's serial queue.
+    // `requestQueue` runs on the socket's strand.
     HostClientConnection(Socket socket, std::shared_ptr<TaskRunner> requestQueue);
     ~HostClientConnection() override;
 
@@ -42,7 +42,7 @@ class HostClientConnection : public ClientConnection,
     int nativeHandle() { return socket_.native_handle(); }
     // Closes the socket from any thread; requests still running reply into the void.
     void close();
-    // The same, on the main thread.
+    // The same, on the connection's strand.
     void closeNow();
 
   private:
@@ -66,7 +66,7 @@ class HostClientConnection : public ClientConnection,
     std::shared_ptr<const RemoteInterface> interface_;
     std::shared_ptr<ExportedObject> object_;
 
-    // Main thread only.
+    // On the strand only.
     IpcFrameCodec decoder_;
     std::string readBuffer_;
     std::deque<std::string> writeQueue_;

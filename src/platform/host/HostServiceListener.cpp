@@ -1,5 +1,8 @@
 #include "platform/host/HostServiceListener.h"
 
+#include <cerrno>
+#include <cstdio>
+
 #include <sys/socket.h>
 #include <unistd.h>
 
@@ -51,17 +54,25 @@ bool HostServiceListener::resume() {
         qaxLog().error("Cannot listen for %@: %@", serviceName_, error);
         return false;
     }
+    // Bound and listening under a private name first, then renamed into place: a client that
+    // sees the service's path can connect at once, never between bind and listen.
+    const std::string staging = socketPath_ + ".starting." + std::to_string(::getpid());
+    ::unlink(staging.c_str());
     asio::error_code ec;
     acceptor_.open(asio::local::stream_protocol(), ec);
     if (!ec) {
-        acceptor_.bind(asio::local::stream_protocol::endpoint(socketPath_), ec);
+        acceptor_.bind(asio::local::stream_protocol::endpoint(staging), ec);
     }
     if (!ec) {
         acceptor_.listen(asio::socket_base::max_listen_connections, ec);
     }
+    if (!ec && std::rename(staging.c_str(), socketPath_.c_str()) != 0) {
+        ec = asio::error_code(errno, asio::error::get_system_category());
+    }
     if (ec) {
         qaxLog().error("Cannot listen for %@ on %@: %@", serviceName_, socketPath_, ec.message());
         acceptor_.close(ec);
+        ::unlink(staging.c_str());
         return false;
     }
     listening_ = true;
@@ -70,37 +81,49 @@ bool HostServiceListener::resume() {
 }
 
 void HostServiceListener::acceptNext() {
-    acceptor_.async_accept(
-        [self = shared_from_this()](const asio::error_code& ec,
-                                    asio::local::stream_protocol::socket socket) {
-            if (ec == asio::error::operation_aborted || !self->listening_) {
-                return;
-            }
-            if (!ec) {
-                auto connection = std::make_shared<HostClientConnection>(
-                    std::move(socket), self->dispatcher_->makeSerialQueue(self->serviceName_));
-                const auto id = self->nextConnection_++;
-                self->connections_[id] = connection;
-                // Forget connections that have gone, now and then, so the table stays small.
-                if (id % 64 == 0) {
-                    std::erase_if(self->connections_,
-                                  [](const auto& entry) { return entry.second.expired(); });
-                }
-                self->offer(connection);
+    acceptor_.async_accept([self = shared_from_this()](
+                               const asio::error_code& ec,
+                               asio::local::stream_protocol::socket socket) {
+        if (ec == asio::error::operation_aborted || !self->listening_) {
+            return;
+        }
+        if (!ec) {
+            // The connection's socket and its request queue share one strand of the pool,
+            // so a request is read, served and answered without changing threads.
+            auto strand = self->dispatcher_->makeIoStrand();
+            asio::local::stream_protocol::socket onStrand(strand.executor);
+            asio::error_code moveError;
+            onStrand.assign(asio::local::stream_protocol(), socket.release(moveError), moveError);
+            if (moveError) {
+                qaxLog().error("Accepting a client of %@ failed: %@", self->serviceName_,
+                               moveError.message());
                 self->acceptNext();
                 return;
             }
-            // Out of descriptors and the like: keep serving the clients already connected and
-            // try again shortly rather than spinning.
-            qaxLog().error("Accepting a client of %@ failed: %@", self->serviceName_, ec.message());
-            auto timer = std::make_shared<asio::steady_timer>(self->dispatcher_->mainContext(),
-                                                              kAcceptRetryDelay);
-            timer->async_wait([self, timer](const asio::error_code& waitError) {
-                if (!waitError && self->listening_) {
-                    self->acceptNext();
-                }
-            });
+            auto connection =
+                std::make_shared<HostClientConnection>(std::move(onStrand), strand.queue);
+            const auto id = self->nextConnection_++;
+            self->connections_[id] = connection;
+            // Forget connections that have gone, now and then, so the table stays small.
+            if (id % 64 == 0) {
+                std::erase_if(self->connections_,
+                              [](const auto& entry) { return entry.second.expired(); });
+            }
+            self->offer(connection);
+            self->acceptNext();
+            return;
+        }
+        // Out of descriptors and the like: keep serving the clients already connected and
+        // try again shortly rather than spinning.
+        qaxLog().error("Accepting a client of %@ failed: %@", self->serviceName_, ec.message());
+        auto timer = std::make_shared<asio::steady_timer>(self->dispatcher_->mainContext(),
+                                                          kAcceptRetryDelay);
+        timer->async_wait([self, timer](const asio::error_code& waitError) {
+            if (!waitError && self->listening_) {
+                self->acceptNext();
+            }
         });
+    });
 }
 
 void HostServiceListener::offer(const std::shared_ptr<HostClientConnection>& connection) {
@@ -137,7 +160,7 @@ void HostServiceListener::invalidate() {
     ::unlink(socketPath_.c_str());
     for (auto& [id, weak] : connections_) {
         if (auto connection = weak.lock()) {
-            connection->closeNow();
+            connection->close();
         }
     }
     connections_.clear();

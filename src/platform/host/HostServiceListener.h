@@ -1,9 +1,9 @@
 // The agent's IPC service on the host: a Unix stream socket named after the service in the
-// runtime directory. Threading: accepting and all socket I/O run on the main io_context (the
-// main thread); each accepted client is checked (HostPeerVerifier) and offered to the
-// delegate on the listener's own serial queue, so the file system work of the check never
-// holds up the main thread; each connection then delivers its requests on a serial queue of
-// its own. resume() and invalidate() are called on the main thread.
+// runtime directory. Threading: accepting runs on the main io_context (the main thread); each
+// accepted client is checked (HostPeerVerifier) and offered to the delegate on the listener's
+// own serial queue, so the file system work of the check never holds up the main thread; each
+// connection then does its socket I/O and delivers its requests on a strand of its own.
+// resume() and invalidate() are called on the main thread.
 #pragma once
 
 #include <asio/local/stream_protocol.hpp>
