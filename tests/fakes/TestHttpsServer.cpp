@@ -2,10 +2,6 @@
 
 #include <arpa/inet.h>
 #include <netinet/in.h>
-#include <openssl/evp.h>
-#include <openssl/pem.h>
-#include <openssl/x509.h>
-#include <openssl/x509v3.h>
 #include <sys/socket.h>
 #include <unistd.h>
 
@@ -14,96 +10,18 @@
 #include <stdexcept>
 
 #include "core/PlistCodec.h"
+#include "platform/host/LocalTlsMaterial.h"
 
 namespace qax::test {
-namespace {
-
-struct KeyDeleter {
-    void operator()(EVP_PKEY* k) const { EVP_PKEY_free(k); }
-};
-struct CertDeleter {
-    void operator()(X509* c) const { X509_free(c); }
-};
-using Key = std::unique_ptr<EVP_PKEY, KeyDeleter>;
-using Cert = std::unique_ptr<X509, CertDeleter>;
-
-Key newKey() {
-    Key key(EVP_PKEY_Q_keygen(nullptr, nullptr, "EC", "P-256"));
-    if (!key) {
-        throw std::runtime_error("EC key generation failed");
-    }
-    return key;
-}
-
-void addExtension(X509* cert, X509* issuer, int nid, const char* value) {
-    X509V3_CTX ctx;
-    X509V3_set_ctx_nodb(&ctx);
-    X509V3_set_ctx(&ctx, issuer, cert, nullptr, nullptr, 0);
-    X509_EXTENSION* ext = X509V3_EXT_conf_nid(nullptr, &ctx, nid, value);
-    if (!ext) {
-        throw std::runtime_error("bad certificate extension");
-    }
-    X509_add_ext(cert, ext, -1);
-    X509_EXTENSION_free(ext);
-}
-
-// A certificate for `key`, signed by `issuerKey` (self-signed when `issuer` is null).
-Cert newCertificate(EVP_PKEY* key, const char* commonName, X509* issuer, EVP_PKEY* issuerKey,
-                    long serial) {
-    Cert cert(X509_new());
-    X509_set_version(cert.get(), 2);
-    ASN1_INTEGER_set(X509_get_serialNumber(cert.get()), serial);
-    X509_gmtime_adj(X509_getm_notBefore(cert.get()), -3600);
-    X509_gmtime_adj(X509_getm_notAfter(cert.get()), 30L * 86400);
-    X509_set_pubkey(cert.get(), key);
-    X509_NAME* name = X509_get_subject_name(cert.get());
-    X509_NAME_add_entry_by_txt(name, "CN", MBSTRING_ASC,
-                               reinterpret_cast<const unsigned char*>(commonName), -1, -1, 0);
-    X509* signer = issuer ? issuer : cert.get();
-    X509_set_issuer_name(cert.get(), X509_get_subject_name(signer));
-    addExtension(cert.get(), signer, NID_subject_key_identifier, "hash");
-    if (!issuer) {
-        addExtension(cert.get(), signer, NID_basic_constraints, "critical,CA:TRUE");
-        addExtension(cert.get(), signer, NID_key_usage, "critical,keyCertSign,cRLSign");
-    } else {
-        addExtension(cert.get(), signer, NID_authority_key_identifier, "keyid");
-        addExtension(cert.get(), signer, NID_basic_constraints, "critical,CA:FALSE");
-        addExtension(cert.get(), signer, NID_key_usage, "critical,digitalSignature");
-        addExtension(cert.get(), signer, NID_ext_key_usage, "serverAuth");
-        addExtension(cert.get(), signer, NID_subject_alt_name, "DNS:localhost,IP:127.0.0.1");
-    }
-    if (X509_sign(cert.get(), issuerKey ? issuerKey : key, EVP_sha256()) == 0) {
-        throw std::runtime_error("certificate signing failed");
-    }
-    return cert;
-}
-
-void writePem(const std::filesystem::path& path, X509* cert, EVP_PKEY* key) {
-    std::FILE* f = std::fopen(path.c_str(), "w");
-    if (!f) {
-        throw std::runtime_error("cannot write " + path.string());
-    }
-    if (cert) {
-        PEM_write_X509(f, cert);
-    }
-    if (key) {
-        PEM_write_PrivateKey(f, key, nullptr, nullptr, 0, nullptr, nullptr);
-    }
-    std::fclose(f);
-}
-
-}  // namespace
 
 TestHttpsServer::TestHttpsServer() {
-    Key caKey = newKey();
-    Cert ca = newCertificate(caKey.get(), "qax test CA", nullptr, nullptr, 1);
-    Key serverKey = newKey();
-    Cert leaf = newCertificate(serverKey.get(), "localhost", ca.get(), caKey.get(), 2);
-    writePem(dir_.path() / "ca.pem", ca.get(), nullptr);
-    writePem(dir_.path() / "server.pem", leaf.get(), nullptr);
-    writePem(dir_.path() / "server-key.pem", nullptr, serverKey.get());
-    server_ = std::make_unique<httplib::SSLServer>((dir_.path() / "server.pem").c_str(),
-                                                   (dir_.path() / "server-key.pem").c_str());
+    TlsMaterial tls;
+    std::string error;
+    if (!loadOrCreateLocalTlsMaterial(dir_.str(), tls, error)) {
+        throw std::runtime_error("cannot make the test server's certificates: " + error);
+    }
+    server_ =
+        std::make_unique<httplib::SSLServer>(tls.serverCertPath.c_str(), tls.serverKeyPath.c_str());
     if (!server_->is_valid()) {
         throw std::runtime_error("the test HTTPS server could not load its certificate");
     }

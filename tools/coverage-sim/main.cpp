@@ -23,10 +23,10 @@
 #include <thread>
 
 #include "AttestationCheck.h"
-#include "SimTlsMaterial.h"
 #include "core/AtomicFile.h"
 #include "core/JsonCodec.h"
 #include "core/PlistCodec.h"
+#include "platform/host/LocalTlsMaterial.h"
 
 namespace coveragesim {
 namespace {
@@ -277,9 +277,9 @@ int main(int argc, char** argv) {
         return usage();
     }
     std::filesystem::create_directories(opt.state);
-    TlsMaterial tls;
+    qax::TlsMaterial tls;
     std::string error;
-    if (!loadOrCreateTlsMaterial(opt.state, tls, error)) {
+    if (!qax::loadOrCreateLocalTlsMaterial(opt.state, tls, error)) {
         std::fprintf(stderr, "coverage-sim: %s\n", error.c_str());
         return 1;
     }

@@ -1,4 +1,4 @@
-#include "SimTlsMaterial.h"
+#include "platform/host/LocalTlsMaterial.h"
 
 #include <openssl/evp.h>
 #include <openssl/pem.h>
@@ -10,7 +10,7 @@
 
 #include "core/AtomicFile.h"
 
-namespace coveragesim {
+namespace qax {
 namespace {
 
 struct Free {
@@ -85,7 +85,7 @@ std::string toPem(F write) {
 }
 
 Key readKey(const std::string& path) {
-    auto pem = qax::readWholeFile(path);
+    auto pem = readWholeFile(path);
     if (!pem) {
         return nullptr;
     }
@@ -94,7 +94,7 @@ Key readKey(const std::string& path) {
 }
 
 Cert readCert(const std::string& path) {
-    auto pem = qax::readWholeFile(path);
+    auto pem = readWholeFile(path);
     if (!pem) {
         return nullptr;
     }
@@ -106,19 +106,19 @@ bool writeKey(const std::string& path, EVP_PKEY* key, std::string& error) {
     auto pem = toPem([&](BIO* b) {
         return PEM_write_bio_PrivateKey(b, key, nullptr, nullptr, 0, nullptr, nullptr);
     });
-    return !pem.empty() && qax::writeFileAtomically(path, pem, &error, 0600);
+    return !pem.empty() && writeFileAtomically(path, pem, &error, 0600);
 }
 
 bool writeCert(const std::string& path, X509* cert, std::string& error) {
     auto pem = toPem([&](BIO* b) { return PEM_write_bio_X509(b, cert); });
-    return !pem.empty() && qax::writeFileAtomically(path, pem, &error, 0644);
+    return !pem.empty() && writeFileAtomically(path, pem, &error, 0644);
 }
 
 }  // namespace
 
-bool loadOrCreateTlsMaterial(const std::string& stateDirectory, TlsMaterial& out,
-                             std::string& error) {
-    const std::filesystem::path dir(stateDirectory);
+bool loadOrCreateLocalTlsMaterial(const std::string& directory, TlsMaterial& out,
+                                  std::string& error) {
+    const std::filesystem::path dir(directory);
     out.caCertPath = (dir / "ca.pem").string();
     out.serverCertPath = (dir / "server.pem").string();
     out.serverKeyPath = (dir / "server-key.pem").string();
@@ -128,9 +128,8 @@ bool loadOrCreateTlsMaterial(const std::string& stateDirectory, TlsMaterial& out
     Cert caCert = readCert(out.caCertPath);
     if (!caKey || !caCert) {
         caKey = newKey();
-        caCert =
-            caKey ? makeCertificate(caKey.get(), "coverage-sim local CA", nullptr, nullptr, true, 1)
-                  : nullptr;
+        caCert = caKey ? makeCertificate(caKey.get(), "qax local CA", nullptr, nullptr, true, 1)
+                       : nullptr;
         if (!caCert || !writeKey(caKeyPath, caKey.get(), error) ||
             !writeCert(out.caCertPath, caCert.get(), error)) {
             error = "cannot create the simulator's CA: " + error;
@@ -153,4 +152,4 @@ bool loadOrCreateTlsMaterial(const std::string& stateDirectory, TlsMaterial& out
     return true;
 }
 
-}  // namespace coveragesim
+}  // namespace qax
