@@ -4,6 +4,7 @@
 #include <cstdio>
 
 #include <sys/socket.h>
+#include <sys/un.h>
 #include <unistd.h>
 
 #include <asio/post.hpp>
@@ -56,7 +57,10 @@ bool HostServiceListener::resume() {
     }
     // Bound and listening under a private name first, then renamed into place: a client that
     // sees the service's path can connect at once, never between bind and listen.
-    const std::string staging = socketPath_ + ".starting." + std::to_string(::getpid());
+    std::string staging = socketPath_ + ".starting." + std::to_string(::getpid());
+    if (staging.size() >= sizeof(sockaddr_un::sun_path)) {
+        staging = socketPath_;  // no room for a private name: bind in place
+    }
     ::unlink(staging.c_str());
     asio::error_code ec;
     acceptor_.open(asio::local::stream_protocol(), ec);
@@ -66,13 +70,15 @@ bool HostServiceListener::resume() {
     if (!ec) {
         acceptor_.listen(asio::socket_base::max_listen_connections, ec);
     }
-    if (!ec && std::rename(staging.c_str(), socketPath_.c_str()) != 0) {
+    if (!ec && staging != socketPath_ && std::rename(staging.c_str(), socketPath_.c_str()) != 0) {
         ec = asio::error_code(errno, asio::error::get_system_category());
     }
     if (ec) {
         qaxLog().error("Cannot listen for %@ on %@: %@", serviceName_, socketPath_, ec.message());
         acceptor_.close(ec);
-        ::unlink(staging.c_str());
+        if (staging != socketPath_) {
+            ::unlink(staging.c_str());
+        }
         return false;
     }
     listening_ = true;
