@@ -96,14 +96,16 @@ class QAXServerVersionUtilitiesTest : public ::testing::Test {
     }
     std::optional<Value> cache() { return preferences().objectForKey(kCache); }
 
-    test::TestHttpsServer server;  // outlives the platform's HTTP session
-    test::TestPlatform tp;
-
   private:
+    // What the server serves: declared before the server so that it outlives its threads.
     std::mutex mutex_;
     std::string body_;
     std::string cacheControl_;
     int hits_ = 0;
+
+  protected:
+    test::TestHttpsServer server;  // outlives the platform's HTTP session
+    test::TestPlatform tp;
 };
 
 TEST_F(QAXServerVersionUtilitiesTest, OverlapOfTheEndPointsDecidesSupportAndTheHighFeatureSet) {
