@@ -211,8 +211,8 @@ TEST(CurlHttpClientTest, TransportFailuresComeBackAsErrors) {
 }
 
 TEST(CurlHttpClientTest, CachesGetAnswersThatAllowItUnlessTheRequestIgnoresTheCache) {
+    std::atomic<int> cachedHits{0}, noStoreHits{0};  // outlive the server's handler threads
     TestHttpsServer server;
-    std::atomic<int> cachedHits{0}, noStoreHits{0};
     server.server().Get("/cached", [&](const httplib::Request&, httplib::Response& res) {
         res.set_header("Cache-Control", "public, max-age=60");
         res.set_content("answer " + std::to_string(++cachedHits), "text/plain");

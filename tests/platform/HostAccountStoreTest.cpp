@@ -153,10 +153,11 @@ TEST_F(HostAccountStoreTest, RenewalWithoutTokenServiceMintsAndStoresAToken) {
 }
 
 TEST_F(HostAccountStoreTest, SigningRenewsThroughTheTokenService) {
-    test::TestHttpsServer server;
+    // The handler's state is declared before the server so that it outlives the server's threads.
     std::mutex mutex;
     std::vector<std::string> bodies;
     int calls = 0;
+    test::TestHttpsServer server;
     server.server().Post("/token", [&](const httplib::Request& req, httplib::Response& res) {
         std::lock_guard lock(mutex);
         bodies.push_back(req.body);

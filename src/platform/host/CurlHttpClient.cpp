@@ -272,6 +272,9 @@ void CurlHttpClient::Session::storeInCache(const HttpRequest& request,
 
 void CurlHttpClient::Session::send(const HttpRequest& request,
                                    std::function<void(HttpResult)> completion) {
+    // The transfer may finish, and its completion release the client, before this call
+    // returns: hold the session until the wake-up below is done.
+    auto self = shared_from_this();
     {
         std::lock_guard<std::mutex> lock(mutex_);
         if (!stopping_) {
