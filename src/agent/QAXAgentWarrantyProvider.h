@@ -23,9 +23,10 @@ class QAXAgentWarrantyProvider {
   public:
     virtual ~QAXAgentWarrantyProvider() = default;
 
-    virtual Value::Array refreshFollowupWithDeviceInfos(
+    // The device infos whose follow-up items were updated or reposted.
+    virtual std::vector<std::shared_ptr<QAXDeviceInfo>> refreshFollowupWithDeviceInfos(
         const std::vector<std::shared_ptr<QAXDeviceInfo>>& deviceInfos) = 0;
-    virtual Value::Array refreshFollowupWithDeviceInfo(
+    virtual std::vector<std::shared_ptr<QAXDeviceInfo>> refreshFollowupWithDeviceInfo(
         const std::shared_ptr<QAXDeviceInfo>& deviceInfo) = 0;
     virtual void dismissFollowUpForSerialNumber(const std::string& serialNumber) = 0;
     virtual void dismissNotificationForSerialNumber(const std::string& serialNumber) = 0;

@@ -32,6 +32,9 @@ class StoreLookup;
 class PurchaseHistory;
 class TelephonyInfo;
 class AnalyticsSink;
+class UserInterfaceStrings;
+class ProcessLifecycle;
+class AgentFactory;
 
 // The log sink is the platform's log service.
 using SystemLog = LogSink;
@@ -43,6 +46,9 @@ struct Platform {
     std::string platformRoot;
     // Where the service and notification sockets live.
     std::string runtimeDirectory;
+    // Installed read-only data: the launch configuration of the activities, the localized
+    // user-interface strings.
+    std::string shareDirectory;
 
     std::shared_ptr<Clock> clock;
     std::shared_ptr<Dispatcher> dispatcher;
@@ -67,6 +73,10 @@ struct Platform {
     std::shared_ptr<PurchaseHistory> purchases;
     std::shared_ptr<TelephonyInfo> telephony;
     std::shared_ptr<AnalyticsSink> analytics;
+    std::shared_ptr<UserInterfaceStrings> uiStrings;
+    std::shared_ptr<ProcessLifecycle> lifecycle;
+    // Not a platform service: the agent's own factory, installed by main (see AgentFactory.h).
+    std::shared_ptr<AgentFactory> agentFactory;
 };
 
 }  // namespace qax

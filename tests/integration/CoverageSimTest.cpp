@@ -113,7 +113,7 @@ TEST(CoverageSim, NegotiatesSignsAttestsAndFetchesASummary) {
           });
 
     auto dispatcher = std::make_shared<AsioDispatcher>(2, 4);
-    HostEnvironment env{(dir.path() / "home").string(), root, root + "/run"};
+    HostEnvironment env{(dir.path() / "home").string(), root, root + "/run", ""};
     auto platform = makeHostPlatform(env, dispatcher);
     qax_registerDefaults(*platform->preferences);
     platform->preferences->setObject(settings::kServerVersionURL,

@@ -42,6 +42,8 @@ HostEnvironment HostEnvironment::fromProcessEnvironment() {
     const char* run = std::getenv("QAX_RUNTIME_DIR");
     env.runtimeDirectory =
         run && *run ? std::string(run) : (std::filesystem::path(env.platformRoot) / "run").string();
+    const char* share = std::getenv("QAX_SHARE_DIR");
+    env.shareDirectory = share && *share ? std::string(share) : std::string(QAX_SOURCE_SHARE_DIR);
     return env;
 }
 
@@ -51,6 +53,7 @@ std::shared_ptr<Platform> makeHostPlatform(const HostEnvironment& environment,
     p->homeDirectory = environment.homeDirectory;
     p->platformRoot = environment.platformRoot;
     p->runtimeDirectory = environment.runtimeDirectory;
+    p->shareDirectory = environment.shareDirectory;
     p->dispatcher = std::move(dispatcher);
     p->clock = std::make_shared<SystemClock>();
     p->log = std::make_shared<StderrLogSink>();

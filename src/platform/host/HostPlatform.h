@@ -1,6 +1,7 @@
 // Builds the platform context of a real process (qaxagent, qaxctl) from its environment:
 // HOME, QAX_PLATFORM_ROOT (default $HOME/.qaxplatform), QAX_RUNTIME_DIR (default
-// $QAX_PLATFORM_ROOT/run). Called once at start-up, on the main thread.
+// $QAX_PLATFORM_ROOT/run), QAX_SHARE_DIR (default: the source tree's share/qaxagent).
+// Called once at start-up, on the main thread.
 #pragma once
 
 #include <memory>
@@ -14,6 +15,7 @@ struct HostEnvironment {
     std::string homeDirectory;
     std::string platformRoot;
     std::string runtimeDirectory;
+    std::string shareDirectory;
 
     static HostEnvironment fromProcessEnvironment();
 };
