@@ -1,7 +1,9 @@
 // In-memory test doubles of the simple platform services.
 #pragma once
 
+#include <atomic>
 #include <map>
+#include <memory>
 #include <mutex>
 #include <optional>
 #include <string>
@@ -9,6 +11,7 @@
 #include "platform/DeviceProperties.h"
 #include "platform/LocaleInfo.h"
 #include "platform/PreferenceStore.h"
+#include "platform/ProcessLifecycle.h"
 
 namespace qax::test {
 
@@ -54,6 +57,23 @@ class FakeLocaleInfo : public LocaleInfo {
 
     std::string identifier = "en_US";
     std::optional<std::string> contentSize = "Large";
+};
+
+// Counts clean-exit requests and the transactions that are open.
+class FakeProcessLifecycle : public ProcessLifecycle {
+  public:
+    void requestCleanExit() override { ++cleanExitRequests; }
+    std::shared_ptr<void> beginTransaction(std::string_view) override {
+        auto counter = openTransactions;
+        ++*counter;
+        return std::shared_ptr<void>(nullptr, [counter](void*) { --*counter; });
+    }
+    int transactionsOpen() const { return *openTransactions; }
+
+    std::atomic<int> cleanExitRequests{0};
+
+  private:
+    std::shared_ptr<std::atomic<int>> openTransactions = std::make_shared<std::atomic<int>>(0);
 };
 
 }  // namespace qax::test

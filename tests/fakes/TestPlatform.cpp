@@ -56,6 +56,7 @@ TestPlatform::TestPlatform() {
     platform->preferences = std::make_shared<InMemoryPreferenceStore>();
     platform->deviceProperties = std::make_shared<FakeDeviceProperties>();
     platform->locale = std::make_shared<FakeLocaleInfo>();
+    platform->lifecycle = std::make_shared<FakeProcessLifecycle>();
 }
 
 TestPlatform::~TestPlatform() {
