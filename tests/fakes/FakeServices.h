@@ -66,7 +66,10 @@ class FakeProcessLifecycle : public ProcessLifecycle {
     std::shared_ptr<void> beginTransaction(std::string_view) override {
         auto counter = openTransactions;
         ++*counter;
-        return std::shared_ptr<void>(nullptr, [counter](void*) { --*counter; });
+        return std::shared_ptr<void>(new int(0), [counter](void* token) {
+            delete static_cast<int*>(token);
+            --*counter;
+        });
     }
     int transactionsOpen() const { return *openTransactions; }
 
