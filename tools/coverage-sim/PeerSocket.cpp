@@ -54,9 +54,9 @@ int findAcceptedSocket(int localPort, int peerPort) {
 bool resetConnection(int fd) {
     // Connecting a TCP socket to AF_UNSPEC dissolves the connection; from the established
     // state the kernel answers with a reset, which is what a crashing server looks like.
-    sockaddr unspecified{};
-    unspecified.sa_family = AF_UNSPEC;
-    return ::connect(fd, &unspecified, sizeof unspecified) == 0;
+    sockaddr noPeer{};
+    noPeer.sa_family = AF_UNSPEC;
+    return ::connect(fd, &noPeer, sizeof noPeer) == 0;
 }
 
 void waitForPeerToLeave(int fd, const std::atomic<bool>& stopping, double maxSeconds) {
