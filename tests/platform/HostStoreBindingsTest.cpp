@@ -1,3 +1,6 @@
+// The host's store bindings against a real HTTPS server: every way a store answer or its
+// configuration can be wrong ends in one completion with a reason, off the caller's thread.
+// Good answers are checked against coverage-sim (CoverageSimScenarioTest).
 #include <gtest/gtest.h>
 
 #include <chrono>
@@ -38,56 +41,28 @@ Answer<Record> wait(Ask ask) {
     return future.get();
 }
 
-class HostStoreBindingsTest : public ::testing::Test {
-  protected:
-    HostStoreBindingsTest() {
-        // Handler state lives in the fixture, declared before the server, so it outlives
-        // the server's threads.
-        auto answer = [](int status, std::string body) {
-            return [status, body](const httplib::Request&, httplib::Response& res) {
-                res.status = status;
-                res.set_content(body, "application/json");
-            };
-        };
-        server.server().Get("/lookup", [this](const httplib::Request& req, httplib::Response& res) {
-            std::lock_guard lock(mutex);
-            queries.push_back(req.params);
-            res.set_content(
-                R"({"results":[{"bundleId":"com.velmora.support","displayName":"Velmora Support",
-                    "artistName":"Velmora","artworkURLs":["https://a/1.png","https://a/2.png"],
-                    "productPageURL":"https://store/app/1"}]})",
-                "application/json");
+TEST(HostStoreBindings, FailuresCompleteOnceWithAReason) {
+    test::TestHttpsServer server;
+    auto answer = [&](const char* path, int status, std::string body) {
+        server.server().Get(path, [status, body](const httplib::Request&, httplib::Response& res) {
+            res.status = status;
+            res.set_content(body, "application/json");
         });
-        server.server().Get("/purchases",
-                            [this](const httplib::Request& req, httplib::Response& res) {
-                                std::lock_guard lock(mutex);
-                                queries.push_back(req.params);
-                                res.set_content(
-                                    R"({"purchases":[{"bundleId":"a.b","title":"Support",
-                                        "developerName":"Velmora","productURL":"https://p/1"},
-                                        {"bundleId":"c.d"}]})",
-                                    "application/json");
-                            });
-        server.server().Get("/empty", answer(200, R"({"results":[],"purchases":[]})"));
-        server.server().Get("/status", answer(503, R"({"results":[],"purchases":[]})"));
-        server.server().Get("/garbage", answer(200, "<html>nope</html>"));
-        server.server().Get("/object", answer(200, R"({"results":{},"purchases":"none"})"));
-        server.server().Get("/array", answer(200, R"([{"results":[]}])"));
-        server.server().Get("/bad-item", answer(200, R"({"results":[5],"purchases":[7]})"));
-        server.server().Get("/bad-field", answer(200, R"({"results":[{"artworkURLs":"x"}],
-                                            "purchases":[{"title":5}]})"));
-        server.start();
-        CurlHttpClient::Options options;
-        options.extraCAFile = server.caFile();
-        http = std::make_shared<CurlHttpClient>(options);
-        dispatcher = std::make_shared<AsioDispatcher>(1, 1);
-    }
-    ~HostStoreBindingsTest() override {
-        http.reset();
-        dispatcher->shutdown();
-    }
-
-    void storeFile(const std::optional<std::string>& url) {
+    };
+    answer("/empty", 200, R"({"results":[],"purchases":[]})");
+    answer("/status", 503, R"({"results":[],"purchases":[]})");
+    answer("/garbage", 200, "<html>nope</html>");
+    answer("/object", 200, R"({"results":{},"purchases":"none"})");
+    answer("/array", 200, R"([{"results":[]}])");
+    answer("/bad-item", 200, R"({"results":[5],"purchases":[7]})");
+    answer("/bad-field", 200, R"({"results":[{"artworkURLs":"x"}],"purchases":[{"title":5}]})");
+    server.start();
+    CurlHttpClient::Options options;
+    options.extraCAFile = server.caFile();
+    auto http = std::make_shared<CurlHttpClient>(options);
+    auto dispatcher = std::make_shared<AsioDispatcher>(1, 1);
+    test::TempDir root;
+    auto storeFile = [&](const std::optional<std::string>& url) {
         const auto path = root.path() / "store.plist";
         if (!url) {
             std::filesystem::remove(path);
@@ -96,55 +71,8 @@ class HostStoreBindingsTest : public ::testing::Test {
         test::writeFile(
             path,
             *toXmlPlist(Value(Value::Dictionary{{"LookupURL", *url}, {"PurchasesURL", *url}})));
-    }
+    };
 
-    std::mutex mutex;
-    std::vector<httplib::Params> queries;
-    test::TestHttpsServer server;
-    test::TempDir root;
-    std::shared_ptr<CurlHttpClient> http;
-    std::shared_ptr<AsioDispatcher> dispatcher;
-};
-
-TEST_F(HostStoreBindingsTest, GoodAnswersBecomeRecords) {
-    HostStoreLookup lookup(root.path().string(), http, dispatcher);
-    HostPurchaseHistory purchases(root.path().string(), http, dispatcher);
-
-    storeFile(server.url("/lookup"));
-    auto found = wait<StoreItem>([&](auto done) {
-        lookup.lookUpBundleIdentifier("com.velmora.support&x=1", std::move(done));
-    });
-    ASSERT_FALSE(found.error) << *found.error;
-    ASSERT_EQ(found.records.size(), 1u);
-    const StoreItem& item = found.records[0];
-    EXPECT_EQ(item.bundleIdentifier, "com.velmora.support");
-    EXPECT_EQ(item.displayName, "Velmora Support");
-    EXPECT_EQ(item.artistName, "Velmora");
-    EXPECT_EQ(item.artworkURLs, (std::vector<std::string>{"https://a/1.png", "https://a/2.png"}));
-    EXPECT_EQ(item.productPageURL, "https://store/app/1");
-    EXPECT_NE(found.thread, std::this_thread::get_id());
-
-    storeFile(server.url("/purchases"));
-    auto bought = wait<PurchaseRecord>([&](auto done) {
-        purchases.purchasesForAccount(42, {"a.b", "c.d"}, std::move(done));
-    });
-    ASSERT_FALSE(bought.error) << *bought.error;
-    ASSERT_EQ(bought.records.size(), 2u);
-    EXPECT_EQ(bought.records[0].bundleIdentifier, "a.b");
-    EXPECT_EQ(bought.records[0].title, "Support");
-    EXPECT_EQ(bought.records[0].developerName, "Velmora");
-    EXPECT_EQ(bought.records[0].productURL, "https://p/1");
-    EXPECT_EQ(bought.records[1].bundleIdentifier, "c.d");
-    EXPECT_FALSE(bought.records[1].title);
-
-    // The parameters arrive intact, however they are spelt.
-    std::lock_guard lock(mutex);
-    ASSERT_EQ(queries.size(), 2u);
-    EXPECT_EQ(queries[0], (httplib::Params{{"bundleId", "com.velmora.support&x=1"}}));
-    EXPECT_EQ(queries[1], (httplib::Params{{"accountId", "42"}, {"bundleIds", "a.b,c.d"}}));
-}
-
-TEST_F(HostStoreBindingsTest, FailuresCompleteOnceWithAReason) {
     const std::string unreachable =
         "https://127.0.0.1:" + std::to_string(test::unusedLocalPort()) + "/lookup";
     struct Row {
@@ -191,6 +119,8 @@ TEST_F(HostStoreBindingsTest, FailuresCompleteOnceWithAReason) {
         wait<StoreItem>([&](auto done) { lookup.lookUpBundleIdentifier("x", std::move(done)); });
     EXPECT_FALSE(none.error);
     EXPECT_TRUE(none.records.empty());
+    http.reset();
+    dispatcher->shutdown();
 }
 
 }  // namespace
