@@ -3,14 +3,11 @@
 // endpoint, and a signed, attested coverage request that the simulator verifies.
 #include <gtest/gtest.h>
 
-#include <signal.h>
-#include <sys/wait.h>
-#include <unistd.h>
-
 #include <chrono>
 #include <future>
 #include <thread>
 
+#include "CoverageSimProcess.h"
 #include "core/AsioDispatcher.h"
 #include "core/AtomicFile.h"
 #include "core/JsonCodec.h"
@@ -29,61 +26,6 @@ namespace {
 
 constexpr const char* kSerial = "C02E2ETEST01";
 
-// coverage-sim started on a free port; stopped with the object.
-class Simulator {
-  public:
-    Simulator(const std::string& state, const std::string& platformRoot) {
-        int out[2];
-        if (pipe(out) != 0) {
-            return;
-        }
-        pid_ = fork();
-        if (pid_ == 0) {
-            dup2(out[1], STDOUT_FILENO);
-            close(out[0]);
-            const std::string root = platformRoot + "/state/attestation/ca.pem";
-            execl(QAX_SIM_BINARY, QAX_SIM_BINARY, "--state", state.c_str(), "--platform-root",
-                  platformRoot.c_str(), "--attestation-root", root.c_str(), nullptr);
-            _exit(127);
-        }
-        close(out[1]);
-        std::string line;
-        char c;
-        while (read(out[0], &c, 1) == 1 && c != '\n') {
-            line += c;
-        }
-        close(out[0]);
-        auto colon = line.rfind(':');
-        if (line.find("listening") != std::string::npos && colon != std::string::npos) {
-            base_ = "https://127.0.0.1:" + line.substr(colon + 1);
-        }
-    }
-    ~Simulator() {
-        if (pid_ > 0) {
-            kill(pid_, SIGTERM);
-            waitpid(pid_, nullptr, 0);
-        }
-    }
-    const std::string& base() const { return base_; }
-
-  private:
-    pid_t pid_ = -1;
-    std::string base_;
-};
-
-std::vector<Value> requestLog(const std::string& state) {
-    std::vector<Value> out;
-    auto text = readWholeFile(state + "/requests.jsonl").value_or("");
-    std::size_t start = 0, end;
-    while ((end = text.find('\n', start)) != std::string::npos) {
-        if (auto v = parseJson(text.substr(start, end - start))) {
-            out.push_back(*v);
-        }
-        start = end + 1;
-    }
-    return out;
-}
-
 HttpResult send(Platform& platform, const HttpRequest& request) {
     std::promise<HttpResult> done;
     platform.http->send(request, [&](HttpResult r) { done.set_value(std::move(r)); });
@@ -94,7 +36,7 @@ TEST(CoverageSim, NegotiatesSignsAttestsAndFetchesASummary) {
     TempDir dir;
     const std::string state = (dir.path() / "sim").string();
     const std::string root = (dir.path() / "root").string();
-    Simulator sim(state, root);
+    CoverageSimProcess sim(state, root);
     ASSERT_FALSE(sim.base().empty()) << "coverage-sim did not start";
 
     auto write = [&](const char* name, const Value& v) {
@@ -147,7 +89,7 @@ TEST(CoverageSim, NegotiatesSignsAttestsAndFetchesASummary) {
     EXPECT_TRUE(warranty->covered());
     EXPECT_GE(warranty->daysEligible(), 29u);
 
-    auto log = requestLog(state);
+    auto log = sim.requestLog();
     ASSERT_GE(log.size(), 3u);  // version list, token, summary
     EXPECT_EQ(*log[log.size() - 2].find("path"), Value("/token"));
     const Value& summaryCall = log.back();

@@ -19,7 +19,9 @@
 #include "platform/host/HostNotificationSocket.h"
 #include "platform/host/HostPairedDeviceRegistry.h"
 #include "platform/host/HostProcessBundleLookup.h"
+#include "platform/host/HostPurchaseHistory.h"
 #include "platform/host/HostServiceListenerFactory.h"
+#include "platform/host/HostStoreLookup.h"
 #include "platform/host/HostSystemNotificationCenter.h"
 #include "platform/host/SystemClock.h"
 
@@ -79,6 +81,8 @@ std::shared_ptr<Platform> makeHostPlatform(const HostEnvironment& environment,
     auto notificationSocket = std::make_shared<HostNotificationSocket>(p->runtimeDirectory);
     p->notifications = std::make_shared<HostSystemNotificationCenter>(notificationSocket);
     p->launchEvents = std::make_shared<HostLaunchEventStream>(notificationSocket, p->dispatcher);
+    p->store = std::make_shared<HostStoreLookup>(p->platformRoot, p->http, p->dispatcher);
+    p->purchases = std::make_shared<HostPurchaseHistory>(p->platformRoot, p->http, p->dispatcher);
     return p;
 }
 

@@ -1,0 +1,38 @@
+// The real coverage-sim for integration tests: started on a free port with the given state
+// directory, platform root and extra options, its base URL read from the line it prints,
+// stopped with SIGTERM when the object goes. Also reads its request log.
+#pragma once
+
+#include <sys/types.h>
+
+#include <string>
+#include <vector>
+
+#include "core/Value.h"
+
+namespace qax::test {
+
+class CoverageSimProcess {
+  public:
+    // `environment` entries ("NAME=value") are added to this process's own.
+    CoverageSimProcess(const std::string& state, const std::string& platformRoot,
+                       const std::vector<std::string>& extraArgs = {},
+                       const std::vector<std::string>& environment = {});
+    ~CoverageSimProcess();
+    CoverageSimProcess(const CoverageSimProcess&) = delete;
+    CoverageSimProcess& operator=(const CoverageSimProcess&) = delete;
+
+    // "https://127.0.0.1:PORT"; empty when the simulator did not start.
+    const std::string& base() const { return base_; }
+    // The CA that issued the simulator's certificate.
+    std::string caFile() const { return state_ + "/ca.pem"; }
+    // The lines of requests.jsonl, parsed.
+    std::vector<Value> requestLog() const;
+
+  private:
+    std::string state_;
+    pid_t pid_ = -1;
+    std::string base_;
+};
+
+}  // namespace qax::test
