@@ -6,6 +6,7 @@
 #include <random>
 #include <sstream>
 
+#include "fakes/FakeBackgroundActivities.h"
 #include "fakes/FakeServices.h"
 
 namespace qax::test {
@@ -57,6 +58,7 @@ TestPlatform::TestPlatform() {
     platform->deviceProperties = std::make_shared<FakeDeviceProperties>();
     platform->locale = std::make_shared<FakeLocaleInfo>();
     platform->lifecycle = std::make_shared<FakeProcessLifecycle>();
+    platform->activities = std::make_shared<FakeBackgroundActivityScheduler>();
 }
 
 TestPlatform::~TestPlatform() {
