@@ -15,6 +15,8 @@ void reportError(bool failed, std::string text, std::optional<std::string>* erro
     }
 }
 
+constexpr const char* kNoServiceError = "no follow-up service on this platform";
+
 }  // namespace
 
 QAXDefaultFolllowUpProvider::QAXDefaultFolllowUpProvider(std::shared_ptr<FollowUpCenter> center)
@@ -22,6 +24,10 @@ QAXDefaultFolllowUpProvider::QAXDefaultFolllowUpProvider(std::shared_ptr<FollowU
 
 bool QAXDefaultFolllowUpProvider::postFollowUpItem(const FollowUpItem& item,
                                                    std::optional<std::string>* error) {
+    if (!center_) {
+        reportError(true, kNoServiceError, error);
+        return false;
+    }
     std::string text;
     const bool ok = center_->postFollowUpItem(kQAXFollowUpClientIdentifier, item, &text);
     reportError(!ok, std::move(text), error);
@@ -30,6 +36,10 @@ bool QAXDefaultFolllowUpProvider::postFollowUpItem(const FollowUpItem& item,
 
 bool QAXDefaultFolllowUpProvider::clearPendingFollowUpItemsWithUniqueIdentifiers(
     const std::vector<std::string>& uniqueIdentifiers, std::optional<std::string>* error) {
+    if (!center_) {
+        reportError(true, kNoServiceError, error);
+        return false;
+    }
     std::string text;
     const bool ok = center_->clearPendingFollowUpItemsWithUniqueIdentifiers(
         kQAXFollowUpClientIdentifier, uniqueIdentifiers, &text);
@@ -39,6 +49,10 @@ bool QAXDefaultFolllowUpProvider::clearPendingFollowUpItemsWithUniqueIdentifiers
 
 std::vector<FollowUpItem> QAXDefaultFolllowUpProvider::pendingFollowUpItems(
     std::optional<std::string>* error) {
+    if (!center_) {
+        reportError(true, kNoServiceError, error);
+        return {};
+    }
     std::string text;
     auto items = center_->pendingFollowUpItems(kQAXFollowUpClientIdentifier, &text);
     reportError(false, std::move(text), error);

@@ -591,6 +591,9 @@ void QAXFollowUp::dismissNotificationForSerialNumber(
         qaxLog().error("%{public}s: Serial number is nil", kDismissNotificationOperation);
         return;
     }
+    if (!platform_->followUps) {
+        return;
+    }
     // The provider has no notification operation; the service is asked directly.
     FollowUpCenter& center = *platform_->followUps;
     const std::string uniqueIdentifier = uniqueIdentfierForSerialNumber(serialNumber);
