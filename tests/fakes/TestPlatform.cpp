@@ -6,7 +6,11 @@
 #include <random>
 #include <sstream>
 
+#include "fakes/FakeAnalyticsSink.h"
+#include "fakes/FakeBackgroundActivities.h"
+#include "fakes/FakeFollowUpCenter.h"
 #include "fakes/FakeServices.h"
+#include "fakes/FakeUserInterfaceStrings.h"
 
 namespace qax::test {
 
@@ -57,6 +61,10 @@ TestPlatform::TestPlatform() {
     platform->deviceProperties = std::make_shared<FakeDeviceProperties>();
     platform->locale = std::make_shared<FakeLocaleInfo>();
     platform->lifecycle = std::make_shared<FakeProcessLifecycle>();
+    platform->activities = std::make_shared<FakeBackgroundActivityScheduler>();
+    platform->followUps = std::make_shared<InMemoryFollowUpCenter>();
+    platform->analytics = std::make_shared<RecordingAnalyticsSink>();
+    platform->uiStrings = std::make_shared<FakeUserInterfaceStrings>();
 }
 
 TestPlatform::~TestPlatform() {
