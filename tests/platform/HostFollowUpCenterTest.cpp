@@ -69,66 +69,48 @@ TEST(HostFollowUpCenter, CodecKeepsEveryFieldAndWritesOptionsByName) {
 
 TEST(HostFollowUpCenter, PostReplaceClearAndDeliverOnlyNewNotifications) {
     test::TempDir root;
-    auto clock = std::make_shared<ManualClock>();
-    HostFollowUpCenter center(root.str(), clock);
-    std::string error;
-    struct Step {
-        const char* name;
-        std::function<bool()> action;
-        std::vector<std::string> ids;  // pending, in order
-        std::vector<std::string> delivered;
-    } steps[] = {
-        {"post without notification",
-         [&] { return center.postFollowUpItem(kClient, item("a", "A", false), &error); },
-         {"a"},
-         {}},
-        {"post with notification",
-         [&] { return center.postFollowUpItem(kClient, item("b", "B", true), &error); },
-         {"a", "b"},
-         {"b"}},
-        {"repost with notification",
-         [&] { return center.postFollowUpItem(kClient, item("b", "B2", true), &error); },
-         {"a", "b"},
-         {"b"}},
-        {"clear notification",
-         [&] { return center.clearNotificationForItem(kClient, item("b", "", false), &error); },
-         {"a", "b"},
-         {"b"}},
-        {"notification again",
-         [&] { return center.postFollowUpItem(kClient, item("b", "B3", true), &error); },
-         {"a", "b"},
-         {"b", "b"}},
-        {"update first in place",
-         [&] {
-             clock->advanceBy(10);
-             return center.postFollowUpItem(kClient, item("a", "A2", true), &error);
-         },
-         {"a", "b"},
-         {"b", "b", "a"}},
-        {"clear",
-         [&] {
-             return center.clearPendingFollowUpItemsWithUniqueIdentifiers(kClient, {"a", "zzz"},
-                                                                          &error);
-         },
-         {"b"},
-         {"b", "b", "a"}},
+    HostFollowUpCenter center(root.str(), std::make_shared<ManualClock>());
+    auto joined = [](const std::vector<std::string>& ids) {
+        std::string s;
+        for (const auto& id : ids) {
+            s += id;
+        }
+        return s;
     };
-    for (const auto& s : steps) {
-        SCOPED_TRACE(s.name);
-        ASSERT_TRUE(s.action()) << error;
+    struct Step {
+        char op;  // p: post, n: clear the notification, c: clear the item
+        const char* id;
+        bool notification;
+        const char* pending;    // identifiers in order
+        const char* delivered;  // identifiers of the notification lines
+    } steps[] = {
+        {'p', "a", false, "a", ""},    {'p', "b", true, "ab", "b"},  {'p', "b", true, "ab", "b"},
+        {'n', "b", false, "ab", "b"},  {'p', "b", true, "ab", "bb"}, {'p', "a", true, "ab", "bba"},
+        {'c', "a", false, "b", "bba"},
+    };
+    for (std::size_t i = 0; i < std::size(steps); ++i) {
+        const Step& s = steps[i];
+        SCOPED_TRACE(i);
+        std::string error;
+        const FollowUpItem posted = item(s.id, "T" + std::to_string(i), s.notification);
+        ASSERT_TRUE(s.op == 'p'   ? center.postFollowUpItem(kClient, posted, &error)
+                    : s.op == 'n' ? center.clearNotificationForItem(kClient, posted, &error)
+                                  : center.clearPendingFollowUpItemsWithUniqueIdentifiers(
+                                        kClient, {s.id, "zzz"}, &error))
+            << error;
         std::vector<std::string> ids;
         for (const auto& p : center.pendingFollowUpItems(kClient, &error)) {
             ids.push_back(*p.uniqueIdentifier);
         }
-        EXPECT_EQ(ids, s.ids);
-        EXPECT_EQ(deliveredIds(root.str()), s.delivered);
+        EXPECT_EQ(joined(ids), s.pending);
+        EXPECT_EQ(joined(deliveredIds(root.str())), s.delivered);
     }
     auto stored = center.storedItems(kClient);
     ASSERT_EQ(stored.size(), 1u);
-    EXPECT_EQ(stored[0].item.title, "B3");
-    EXPECT_TRUE(stored[0].item.notification);
-    EXPECT_FALSE(center.clearNotificationForItem(kClient, item("gone", "", false), &error));
-    EXPECT_FALSE(center.postFollowUpItem("../escape", item("x", "", false), &error));
+    EXPECT_EQ(stored[0].item.title, "T4");
+    EXPECT_TRUE(stored[0].item.notification) << "clearing one notification kept the item";
+    EXPECT_FALSE(center.clearNotificationForItem(kClient, item("gone", "", false), nullptr));
+    EXPECT_FALSE(center.postFollowUpItem("../escape", item("x", "", false), nullptr));
 }
 
 TEST(HostFollowUpCenter, TwoProcessesPostingAtOnceLoseNothing) {
