@@ -4,6 +4,7 @@
 #include <gtest/gtest.h>
 
 #include <functional>
+#include <limits>
 #include <map>
 #include <vector>
 
@@ -244,6 +245,9 @@ TEST(HostBackgroundActivityScheduler, NetworkRequirementNegativeDelayAndDefer) {
     std::vector<double> fires;
     h.schedule("net", -30, h.recorder(fires), true);
     EXPECT_EQ(h.record("net").delay, 0);
+    h.schedule("far", std::numeric_limits<std::int64_t>::max(), h.recorder(fires));
+    EXPECT_TRUE(h.record("far").pending()) << "an absurd delay still leaves a writable registry";
+    EXPECT_TRUE(h.record("net").pending());
     h.env.runner->advanceBy(600);
     EXPECT_TRUE(fires.empty());
     h.network = true;

@@ -34,6 +34,9 @@ class HostActivityRegistry {
   public:
     using Records = std::map<std::string, ActivityRecord>;
 
+    // The latest date the file stores (property-list dates count 32-bit seconds from 2001).
+    static constexpr Date kLatestDate = Date(kSecondsFrom1970To2001 + 2147483647.0);
+
     static std::string path(const std::string& platformRoot);
     // A missing file is an empty registry; an unreadable one too, logged (and left alone).
     static Records load(const std::string& platformRoot);

@@ -182,9 +182,15 @@ void HostBackgroundActivityScheduler::schedule(std::uint64_t owner, const std::s
         Slot& slot = slots_[identifier];
         slot.handler = std::move(handler);
         slot.handlerOwner = owner;
-        register_(slot, platform->clock->now(), std::max<std::int64_t>(0, criteria.delaySeconds),
-                  std::max<std::int64_t>(0, criteria.gracePeriodSeconds), criteria.requiresNetwork,
-                  false, owner);
+        // A due date the registry file cannot store would keep every other registration from
+        // being persisted: such a delay ends at the last storable date.
+        const Date now = platform->clock->now();
+        const auto maximumDelay = std::max<std::int64_t>(
+            0, static_cast<std::int64_t>(
+                   std::floor(HostActivityRegistry::kLatestDate.timeIntervalSince(now))));
+        register_(slot, now, std::clamp<std::int64_t>(criteria.delaySeconds, 0, maximumDelay),
+                  std::clamp<std::int64_t>(criteria.gracePeriodSeconds, 0, maximumDelay),
+                  criteria.requiresNetwork, false, owner);
         saveLocked();
         qaxLog().info(
             "Activity '%@' scheduled for %@ (delay %ld s, grace period %ld s, network %d)",
