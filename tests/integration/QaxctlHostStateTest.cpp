@@ -150,8 +150,8 @@ TEST(QaxctlHostState, ActivitiesFromTheLaunchConfigurationRegistryAndPreferences
     EXPECT_EQ(*o.find("registration")->find("dueDate"), Value(now.byAdding(3600).iso8601()));
     EXPECT_EQ(*o.find("registration")->find("due"), Value(false));
     // The preference domain is XML: its dates keep whole seconds.
-    EXPECT_NEAR(Date::parseIso8601(*o.find("targetDate")->asString())->timeIntervalSince(now),
-                3600, 1);
+    EXPECT_NEAR(Date::parseIso8601(*o.find("targetDate")->asString())->timeIntervalSince(now), 3600,
+                1);
     EXPECT_EQ(*o.find("lastResult"), Value(2));
     EXPECT_FALSE(byId["com.velmora.qaxagent.boot"].find("registration"));
 
