@@ -5,14 +5,18 @@
 
 #include <cstdlib>
 #include <filesystem>
+#include <string_view>
 
 #include "platform/host/CurlHttpClient.h"
 #include "platform/host/FilePreferenceStore.h"
 #include "platform/host/HostAccountStore.h"
+#include "platform/host/HostAnalyticsSink.h"
 #include "platform/host/HostApplicationRegistry.h"
 #include "platform/host/HostAttestationService.h"
+#include "platform/host/HostBackgroundActivityScheduler.h"
 #include "platform/host/HostDeviceProperties.h"
 #include "platform/host/HostFeatureFlags.h"
+#include "platform/host/HostFollowUpCenter.h"
 #include "platform/host/HostIdentityAccountManager.h"
 #include "platform/host/HostLaunchEventStream.h"
 #include "platform/host/HostLocaleInfo.h"
@@ -23,6 +27,9 @@
 #include "platform/host/HostServiceListenerFactory.h"
 #include "platform/host/HostStoreLookup.h"
 #include "platform/host/HostSystemNotificationCenter.h"
+#include "platform/host/HostTelephonyInfo.h"
+#include "platform/host/HostUserInterfaceStrings.h"
+#include "platform/host/SimulatedClock.h"
 #include "platform/host/SystemClock.h"
 
 namespace qax {
@@ -46,7 +53,16 @@ HostEnvironment HostEnvironment::fromProcessEnvironment() {
         run && *run ? std::string(run) : (std::filesystem::path(env.platformRoot) / "run").string();
     const char* share = std::getenv("QAX_SHARE_DIR");
     env.shareDirectory = share && *share ? std::string(share) : std::string(QAX_SOURCE_SHARE_DIR);
+    const char* clock = std::getenv("QAX_CLOCK");
+    env.simulatedClock = clock && std::string_view(clock) == "simulated";
     return env;
+}
+
+std::shared_ptr<Clock> makeHostClock(const HostEnvironment& environment) {
+    if (environment.simulatedClock) {
+        return std::make_shared<SimulatedClock>(environment.platformRoot);
+    }
+    return std::make_shared<SystemClock>();
 }
 
 std::shared_ptr<Platform> makeHostPlatform(const HostEnvironment& environment,
@@ -57,7 +73,7 @@ std::shared_ptr<Platform> makeHostPlatform(const HostEnvironment& environment,
     p->runtimeDirectory = environment.runtimeDirectory;
     p->shareDirectory = environment.shareDirectory;
     p->dispatcher = std::move(dispatcher);
-    p->clock = std::make_shared<SystemClock>();
+    p->clock = makeHostClock(environment);
     p->log = std::make_shared<StderrLogSink>();
     p->preferences = std::make_shared<FilePreferenceStore>(
         FilePreferenceStore::domainPath(environment.homeDirectory));
@@ -83,6 +99,21 @@ std::shared_ptr<Platform> makeHostPlatform(const HostEnvironment& environment,
     p->launchEvents = std::make_shared<HostLaunchEventStream>(notificationSocket, p->dispatcher);
     p->store = std::make_shared<HostStoreLookup>(p->platformRoot, p->http, p->dispatcher);
     p->purchases = std::make_shared<HostPurchaseHistory>(p->platformRoot, p->http, p->dispatcher);
+
+    // Activities, follow-ups, analytics, user-interface strings, telephony. The activity
+    // scheduler subscribes to the clock-changed notification only once the agent attaches or
+    // schedules an activity, so that qaxctl never binds the notification socket.
+    HostBackgroundActivityScheduler::Options activityOptions;
+    activityOptions.platformRoot = p->platformRoot;
+    activityOptions.shareDirectory = p->shareDirectory;
+    if (auto simulatedClock = std::dynamic_pointer_cast<SimulatedClock>(p->clock)) {
+        activityOptions.clockChanged = [simulatedClock] { simulatedClock->reloadOffset(); };
+    }
+    p->activities = std::make_shared<HostBackgroundActivityScheduler>(p, activityOptions);
+    p->followUps = std::make_shared<HostFollowUpCenter>(p->platformRoot, p->clock);
+    p->analytics = std::make_shared<HostAnalyticsSink>(p->platformRoot, p->clock);
+    p->uiStrings = std::make_shared<HostUserInterfaceStrings>(p->shareDirectory, p->locale);
+    p->telephony = std::make_shared<HostTelephonyInfo>(p->platformRoot);
     return p;
 }
 

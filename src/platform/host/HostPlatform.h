@@ -1,6 +1,7 @@
 // Builds the platform context of a real process (qaxagent, qaxctl) from its environment:
 // HOME, QAX_PLATFORM_ROOT (default $HOME/.qaxplatform), QAX_RUNTIME_DIR (default
-// $QAX_PLATFORM_ROOT/run), QAX_SHARE_DIR (default: the source tree's share/qaxagent).
+// $QAX_PLATFORM_ROOT/run), QAX_SHARE_DIR (default: the source tree's share/qaxagent),
+// QAX_CLOCK ("simulated": the platform clock runs at an offset kept in state/clock.plist).
 // Called once at start-up, on the main thread.
 #pragma once
 
@@ -16,9 +17,14 @@ struct HostEnvironment {
     std::string platformRoot;
     std::string runtimeDirectory;
     std::string shareDirectory;
+    bool simulatedClock = false;
 
     static HostEnvironment fromProcessEnvironment();
 };
+
+// The platform clock of `environment`: the system clock, or under QAX_CLOCK=simulated the
+// system time plus the offset of state/clock.plist (a SimulatedClock).
+std::shared_ptr<Clock> makeHostClock(const HostEnvironment& environment);
 
 std::shared_ptr<Platform> makeHostPlatform(const HostEnvironment& environment,
                                            std::shared_ptr<Dispatcher> dispatcher);
