@@ -59,7 +59,8 @@ X509* parseDer(const std::vector<std::uint8_t>& der) {
 
 AttestationVerdict checkAttestation(const std::optional<std::string>& signatureHeader,
                                     const std::optional<std::string>& certificatesHeader,
-                                    const std::string& body, const std::string& rootPem) {
+                                    const std::string& body, const std::string& rootPem,
+                                    double verifyAt) {
     AttestationVerdict v;
     v.present = signatureHeader.has_value() && certificatesHeader.has_value();
     if (!v.present) {
@@ -106,6 +107,7 @@ AttestationVerdict checkAttestation(const std::optional<std::string>& signatureH
         }
         // The leaf carries the device's private extensions, which no verifier knows.
         X509_STORE_CTX_set_flags(ctx.get(), X509_V_FLAG_IGNORE_CRITICAL);
+        X509_STORE_CTX_set_time(ctx.get(), 0, static_cast<time_t>(verifyAt));
         if (X509_verify_cert(ctx.get()) != 1) {
             v.reason = std::string("chain does not verify: ") +
                        X509_verify_cert_error_string(X509_STORE_CTX_get_error(ctx.get()));

@@ -16,9 +16,12 @@ struct AttestationVerdict {
 };
 
 // `rootPem` is the attestation root certificate; empty when none is configured (then the
-// chain is not checked, only the signature against the leaf).
+// chain is not checked, only the signature against the leaf). The chain is checked as of
+// `verifyAt` (seconds since 1970): the service's "now", which follows a device's simulated
+// clock, so a certificate issued by a device whose clock was moved ahead still verifies.
 AttestationVerdict checkAttestation(const std::optional<std::string>& signatureHeader,
                                     const std::optional<std::string>& certificatesHeader,
-                                    const std::string& body, const std::string& rootPem);
+                                    const std::string& body, const std::string& rootPem,
+                                    double verifyAt);
 
 }  // namespace coveragesim

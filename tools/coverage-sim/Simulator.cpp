@@ -364,8 +364,8 @@ void Simulator::summary(const httplib::Request& req, httplib::Response& res,
     // after the simulator started.
     const std::string rootPem =
         opt_.attestationRoot.empty() ? "" : qax::readWholeFile(opt_.attestationRoot).value_or("");
-    auto verdict =
-        checkAttestation(header("X-Velmora-Kva-S"), header("X-Velmora-Kva"), req.body, rootPem);
+    auto verdict = checkAttestation(header("X-Velmora-Kva-S"), header("X-Velmora-Kva"), req.body,
+                                    rootPem, now());
     notes["attestation"] =
         verdict.present ? (verdict.valid ? "valid" : "invalid: " + verdict.reason) : "absent";
     if (verdict.present && !verdict.valid) {
