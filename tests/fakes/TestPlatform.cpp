@@ -6,6 +6,7 @@
 #include <random>
 #include <sstream>
 
+#include "fakes/FakeAgentFactory.h"
 #include "fakes/FakeServices.h"
 
 namespace qax::test {
@@ -57,6 +58,7 @@ TestPlatform::TestPlatform() {
     platform->deviceProperties = std::make_shared<FakeDeviceProperties>();
     platform->locale = std::make_shared<FakeLocaleInfo>();
     platform->lifecycle = std::make_shared<FakeProcessLifecycle>();
+    platform->agentFactory = std::make_shared<FakeAgentFactory>();
 }
 
 TestPlatform::~TestPlatform() {
