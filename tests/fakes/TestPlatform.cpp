@@ -7,7 +7,11 @@
 #include <sstream>
 
 #include "fakes/FakeAgentFactory.h"
+#include "fakes/FakeAnalyticsSink.h"
+#include "fakes/FakeBackgroundActivities.h"
+#include "fakes/FakeFollowUpCenter.h"
 #include "fakes/FakeServices.h"
+#include "fakes/FakeUserInterfaceStrings.h"
 
 namespace qax::test {
 
@@ -59,6 +63,10 @@ TestPlatform::TestPlatform() {
     platform->locale = std::make_shared<FakeLocaleInfo>();
     platform->lifecycle = std::make_shared<FakeProcessLifecycle>();
     platform->agentFactory = std::make_shared<FakeAgentFactory>();
+    platform->activities = std::make_shared<FakeBackgroundActivityScheduler>();
+    platform->followUps = std::make_shared<InMemoryFollowUpCenter>();
+    platform->analytics = std::make_shared<RecordingAnalyticsSink>();
+    platform->uiStrings = std::make_shared<FakeUserInterfaceStrings>();
 }
 
 TestPlatform::~TestPlatform() {

@@ -1,0 +1,32 @@
+// User-interface strings from a table a test fills: key -> text, for every table alike; a key
+// not in it gives the default value. Remembers the tables it was asked for. Thread-safe.
+#pragma once
+
+#include <map>
+#include <mutex>
+#include <string>
+#include <vector>
+
+#include "platform/UserInterfaceStrings.h"
+
+namespace qax::test {
+
+class FakeUserInterfaceStrings : public UserInterfaceStrings {
+  public:
+    std::string localizedString(std::string_view key, std::string_view defaultValue,
+                                std::string_view table) override;
+
+    void set(const std::string& key, const std::string& text);
+    std::vector<std::string> tablesAsked() const;
+
+  private:
+    mutable std::mutex mutex_;
+    std::map<std::string, std::string, std::less<>> texts_{
+        {"DETAILS", "Details"},
+        {"CLEAR_NOTIFICATION", "Clear"},
+        {"INSTALLED", "Installed"},
+    };
+    std::vector<std::string> tables_;
+};
+
+}  // namespace qax::test
