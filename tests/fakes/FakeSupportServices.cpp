@@ -94,18 +94,4 @@ std::vector<FakePurchaseHistory::Query> FakePurchaseHistory::queries() {
     return queries_;
 }
 
-std::string FakeUserInterfaceStrings::localizedString(std::string_view key,
-                                                      std::string_view defaultValue,
-                                                      std::string_view table) {
-    std::lock_guard lock(mutex_);
-    lastTable_ = std::string(table);
-    auto it = texts.find(key);
-    return it == texts.end() ? std::string(defaultValue) : it->second;
-}
-
-std::string FakeUserInterfaceStrings::lastTable() {
-    std::lock_guard lock(mutex_);
-    return lastTable_;
-}
-
 }  // namespace qax::test

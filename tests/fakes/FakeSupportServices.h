@@ -1,7 +1,7 @@
 // Test doubles of the services behind the support-application row: the application registry,
-// the store look-up, the purchase history and the user-interface strings. Store and purchase
-// answers come on threads of their own, as the platform's do; a purchase answer can be held
-// back and released late. Thread-safe.
+// the store look-up and the purchase history. Store and purchase answers come on threads of
+// their own, as the platform's do; a purchase answer can be held back and released late.
+// Thread-safe.
 #pragma once
 
 #include <map>
@@ -14,7 +14,6 @@
 #include "platform/ApplicationRegistry.h"
 #include "platform/PurchaseHistory.h"
 #include "platform/StoreLookup.h"
-#include "platform/UserInterfaceStrings.h"
 
 namespace qax::test {
 
@@ -75,21 +74,6 @@ class FakePurchaseHistory : public PurchaseHistory {
     std::vector<Completion> held_;
     std::vector<Query> queries_;
     TaskThreads threads_;
-};
-
-// Texts by key; a key not set gives the caller's default.
-class FakeUserInterfaceStrings : public UserInterfaceStrings {
-  public:
-    std::string localizedString(std::string_view key, std::string_view defaultValue,
-                                std::string_view table) override;
-    std::string lastTable();
-
-    // Set before use.
-    std::map<std::string, std::string, std::less<>> texts;
-
-  private:
-    std::mutex mutex_;
-    std::string lastTable_;
 };
 
 }  // namespace qax::test

@@ -163,9 +163,9 @@ TEST_F(AgentServiceTest, ErrorRepliesLeaveTheConnectionOpen) {
     const std::tuple<const char*, Value::Array, const char*> cases[] = {
         {"noSuchOperation:", {}, "unknown operation 'noSuchOperation:'"},
         {"defaultDevice:", {Value(1)}, "wrong arguments"},
-        {"getAllDeviceInfosUsingPolicy:updateFollowUps:withReply:",
-         {Value(0), Value(true)},
-         "unsupported operation"},
+        {"getDeviceInfoForSerialNumber:usingPolicy:withReply:",
+         {Value(""), Value(0)},
+         "wrong arguments"},
     };
     for (const auto& [op, args, error] : cases) {
         std::string transport;

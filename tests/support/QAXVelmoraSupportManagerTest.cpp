@@ -9,6 +9,7 @@
 
 #include "fakes/FakeAccounts.h"
 #include "fakes/FakeSupportServices.h"
+#include "fakes/FakeUserInterfaceStrings.h"
 #include "fakes/TestPlatform.h"
 #include "platform/PreferenceStore.h"
 
@@ -27,7 +28,7 @@ class QAXVelmoraSupportManagerTest : public ::testing::Test {
         tp.platform->store = store;
         tp.platform->purchases = purchases;
         tp.platform->accounts = accounts;
-        strings->texts["INSTALLED"] = "Installée";
+        strings->set("INSTALLED", "Installée");
         tp.platform->uiStrings = strings;
     }
     ~QAXVelmoraSupportManagerTest() override {
@@ -228,6 +229,7 @@ TEST_F(QAXVelmoraSupportManagerTest, InstalledThenPurchasedThenStore) {
         localStore->drain();
         localPurchases->drain();
     }
+    EXPECT_EQ(strings->tablesAsked(), std::vector<std::string>{"Localizable"});
 }
 
 TEST_F(QAXVelmoraSupportManagerTest, PurchaseQueryUsesThePrimaryAccountsStoreAccount) {
