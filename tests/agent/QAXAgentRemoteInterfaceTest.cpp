@@ -9,27 +9,13 @@
 #include "fakes/FakeAgentFactory.h"
 #include "fakes/FakeServices.h"
 #include "fakes/FakeWarrantyProvider.h"
+#include "fakes/FixedDeviceProvider.h"
 #include "fakes/TestPlatform.h"
 
 namespace qax {
 namespace {
 
-class FixedDevices : public QAXAgentDeviceProvider {
-  public:
-    std::shared_ptr<QAXDevice> defaultDevice() override { return phone; }
-    QAXDeviceMap pairedDevices() override { return watches; }
-    QAXDeviceMap allDevices() override {
-        QAXDeviceMap all = watches;
-        all[*phone->serialNumber()] = phone;
-        return all;
-    }
-    std::shared_ptr<QAXDevice> phone =
-        QAXDevice::deviceWithName("Default Device", "PHONE1", Date(10), QAXDeviceTypeDefault);
-    QAXDeviceMap watches = {
-        {"W1", QAXDevice::deviceWithName("One", "W1", Date(20), QAXDeviceTypeWatch)},
-        {"W2", QAXDevice::deviceWithName("Two", "W2", std::nullopt, QAXDeviceTypeWatch)},
-    };
-};
+using FixedDevices = test::FixedDeviceProvider;
 
 class QAXAgentRemoteInterfaceTest : public ::testing::Test {
   protected:

@@ -7,8 +7,8 @@
 #include <thread>
 
 #include "fakes/FakeAgentFactory.h"
-#include "fakes/FakeServices.h"
 #include "fakes/FakeWarrantyProvider.h"
+#include "fakes/FixedDeviceProvider.h"
 #include "fakes/TestPlatform.h"
 #include "platform/PreferenceStore.h"
 #include "platform/QAXSettings.h"
@@ -19,23 +19,6 @@ namespace qax {
 namespace {
 
 using Cache = test::FakeWarrantyProvider::Cache;
-
-class Devices : public QAXAgentDeviceProvider {
-  public:
-    std::shared_ptr<QAXDevice> defaultDevice() override { return phone; }
-    QAXDeviceMap pairedDevices() override { return watches; }
-    QAXDeviceMap allDevices() override {
-        QAXDeviceMap all = watches;
-        all[*phone->serialNumber()] = phone;
-        return all;
-    }
-    std::shared_ptr<QAXDevice> phone =
-        QAXDevice::deviceWithName("Default Device", "PHONE", Date(10), QAXDeviceTypeDefault);
-    QAXDeviceMap watches = {
-        {"W1", QAXDevice::deviceWithName("One", "W1", Date(20), QAXDeviceTypeWatch)},
-        {"W2", QAXDevice::deviceWithName("Two", "W2", std::nullopt, QAXDeviceTypeWatch)},
-    };
-};
 
 class QAXAgentTest : public ::testing::Test {
   protected:
@@ -68,7 +51,8 @@ class QAXAgentTest : public ::testing::Test {
     test::TestPlatform env;
     std::shared_ptr<test::FakeWarrantyProvider> provider =
         std::make_shared<test::FakeWarrantyProvider>();
-    std::shared_ptr<Devices> devices = std::make_shared<Devices>();
+    std::shared_ptr<test::FixedDeviceProvider> devices =
+        std::make_shared<test::FixedDeviceProvider>();
     std::shared_ptr<QAXAgent> agent =
         QAXAgent::initWithWarrantyProvider(env.platform, provider, devices);
 };
@@ -198,29 +182,22 @@ TEST_F(QAXAgentTest, AllDevicesJoinWaitsForOverlappingCallsOnOneAgent) {
             bySerial[*info->device()->serialNumber()] = tagOf(info->warranty());
         }
         EXPECT_EQ(bySerial, (std::map<std::string, std::string>{
-                                {"PHONE", "none"}, {"W1", "w1"}, {"W2", "none"}}));
+                                {"PHONE1", "none"}, {"W1", "w1"}, {"W2", "none"}}));
     }
     // Only the call that asked refreshes the follow-ups, with its own answers.
     auto refreshed = provider->refreshedLists();
     ASSERT_EQ(refreshed.size(), 1u);
     EXPECT_EQ(refreshed[0], first[0]);
-}
 
-TEST_F(QAXAgentTest, NoDevicesGivesAnEmptyArray) {
-    struct NoDevices : QAXAgentDeviceProvider {
-        std::shared_ptr<QAXDevice> defaultDevice() override { return nullptr; }
-        QAXDeviceMap pairedDevices() override { return {}; }
-        QAXDeviceMap allDevices() override { return {}; }
-    };
-    agent->setDeviceProvider(std::make_shared<NoDevices>());
-    int replies = 0;
-    agent->getAllDeviceInfosUsingPolicy(QAXWarrantyPolicyDefault, true, [&](auto infos) {
-        ++replies;
-        EXPECT_TRUE(infos.empty());
-    });
-    EXPECT_EQ(replies, 0);  // delivered on the policy queue
+    // Nothing outstanding: an empty array, still on the policy queue.
+    devices->phone = nullptr;
+    devices->watches.clear();
+    agent->getAllDeviceInfosUsingPolicy(QAXWarrantyPolicyDefault, true,
+                                        [&](auto infos) { first.push_back(infos); });
+    EXPECT_EQ(first.size(), 1u);
     env.runner->runUntilIdle();
-    EXPECT_EQ(replies, 1);
+    ASSERT_EQ(first.size(), 2u);
+    EXPECT_TRUE(first[1].empty());
 }
 
 TEST_F(QAXAgentTest, SerialNumberSubstitutionsWatchesWinOverAccessories) {
@@ -239,7 +216,7 @@ TEST_F(QAXAgentTest, SerialNumberSubstitutionsWatchesWinOverAccessories) {
         {"X", "W1", "One", QAXDeviceTypeWatch},
         {"A", "B", "<unknown>", QAXDeviceTypeOther},
         {"N", "N", "<unknown>", QAXDeviceTypeOther},
-        {"PHONE", "PHONE", "Default Device", QAXDeviceTypeDefault},
+        {"PHONE1", "PHONE1", "Default Device", QAXDeviceTypeDefault},
     };
     for (const auto& row : rows) {
         SCOPED_TRACE(row.asked);
@@ -265,9 +242,11 @@ TEST_F(QAXAgentTest, MigrationRunsOnceBeforeVersionTwo) {
         std::vector<std::string> calls;
     } rows[] = {
         {0,
-         {"migrateWarranty PHONE", "migrateFollowUp PHONE with warranty", "setMigrationVersion 2"}},
+         {"migrateWarranty PHONE1", "migrateFollowUp PHONE1 with warranty",
+          "setMigrationVersion 2"}},
         {1,
-         {"migrateWarranty PHONE", "migrateFollowUp PHONE with warranty", "setMigrationVersion 2"}},
+         {"migrateWarranty PHONE1", "migrateFollowUp PHONE1 with warranty",
+          "setMigrationVersion 2"}},
         {2, {}},
         {3, {}},
     };

@@ -1,12 +1,8 @@
-// A test double of the agent factory: records every activity scheduling and every agent
-// asked for, and hands out the agent the test sets. Thread-safe.
+// A test double of the agent factory: records every activity scheduling and hands out the
+// agent the test sets. Thread-safe.
 #pragma once
 
-#include <memory>
 #include <mutex>
-#include <optional>
-#include <string>
-#include <utility>
 #include <vector>
 
 #include "platform/AgentFactory.h"
@@ -20,18 +16,27 @@ class FakeAgentFactory : public AgentFactory {
         std::optional<Date> date;
     };
 
-    std::shared_ptr<QAXAgentProtocol> makeAgent(const std::string& callingProcessBundleID) override;
-    void scheduleActivityForDate(const std::string& identifier, std::optional<Date> date) override;
-
-    void setAgent(std::shared_ptr<QAXAgentProtocol> agent);
-    std::vector<Scheduling> schedulings();
-    std::vector<std::string> agentsMadeFor();
+    std::shared_ptr<QAXAgentProtocol> makeAgent(const std::string&) override {
+        std::lock_guard lock(mutex_);
+        return agent_;
+    }
+    void scheduleActivityForDate(const std::string& identifier, std::optional<Date> date) override {
+        std::lock_guard lock(mutex_);
+        schedulings_.push_back({identifier, date});
+    }
+    void setAgent(std::shared_ptr<QAXAgentProtocol> agent) {
+        std::lock_guard lock(mutex_);
+        agent_ = std::move(agent);
+    }
+    std::vector<Scheduling> schedulings() {
+        std::lock_guard lock(mutex_);
+        return schedulings_;
+    }
 
   private:
     std::mutex mutex_;
     std::shared_ptr<QAXAgentProtocol> agent_;
     std::vector<Scheduling> schedulings_;
-    std::vector<std::string> agentsMadeFor_;
 };
 
 }  // namespace qax::test

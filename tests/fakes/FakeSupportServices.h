@@ -1,16 +1,12 @@
 // Test doubles of the services behind the support-application row: the application registry,
-// the store look-up and the purchase history. Store and purchase answers come on threads of
-// their own, as the platform's do; a purchase answer can be held back and released late.
-// Thread-safe.
+// the store look-up and the purchase history. They answer on the caller's thread, except that
+// purchase answers can be held back and released late. Set their answers before use.
 #pragma once
 
-#include <map>
+#include <atomic>
 #include <mutex>
-#include <optional>
-#include <string>
 #include <vector>
 
-#include "fakes/FakeAccounts.h"
 #include "platform/ApplicationRegistry.h"
 #include "platform/PurchaseHistory.h"
 #include "platform/StoreLookup.h"
@@ -20,60 +16,67 @@ namespace qax::test {
 class FakeApplicationRegistry : public ApplicationRegistry {
   public:
     std::optional<ApplicationRecord> applicationForBundleIdentifier(
-        const std::string& bundleIdentifier) override;
-    std::optional<ApplicationRecord> applicationForExecutablePath(const std::string& path) override;
-    Value::Dictionary entitlementsForExecutablePath(const std::string& path) override;
+        const std::string& id) override {
+        for (const auto& r : records) {
+            if (r.bundleIdentifier == id) {
+                return r;
+            }
+        }
+        return std::nullopt;
+    }
+    std::optional<ApplicationRecord> applicationForExecutablePath(const std::string&) override {
+        return std::nullopt;
+    }
+    Value::Dictionary entitlementsForExecutablePath(const std::string&) override { return {}; }
 
-    void add(ApplicationRecord record);
-
-  private:
-    std::mutex mutex_;
-    std::vector<ApplicationRecord> records_;
+    std::vector<ApplicationRecord> records;  // set before use
 };
 
 class FakeStoreLookup : public StoreLookup {
   public:
-    void lookUpBundleIdentifier(
-        const std::string& bundleIdentifier,
-        std::function<void(std::vector<StoreItem>, std::optional<std::string>)> completion)
-        override;
-    void answer(std::vector<StoreItem> items, std::optional<std::string> error = std::nullopt);
-    std::vector<std::string> lookups();
-    void drain() { threads_.drain(); }
-
-  private:
-    std::mutex mutex_;
-    std::vector<StoreItem> items_;
-    std::optional<std::string> error_;
-    std::vector<std::string> lookups_;
-    TaskThreads threads_;
+    using Completion = std::function<void(std::vector<StoreItem>, std::optional<std::string>)>;
+    void lookUpBundleIdentifier(const std::string&, Completion completion) override {
+        ++lookups;
+        completion(items, error);
+    }
+    // Set before use.
+    std::vector<StoreItem> items;
+    std::optional<std::string> error;
+    std::atomic<int> lookups{0};
 };
 
 class FakePurchaseHistory : public PurchaseHistory {
   public:
-    struct Query {
-        std::int64_t accountId;
-        std::vector<std::string> bundleIdentifiers;
-    };
-    void purchasesForAccount(
-        std::int64_t storeAccountId, const std::vector<std::string>& bundleIdentifiers,
-        std::function<void(std::vector<PurchaseRecord>, std::optional<std::string>)> completion)
-        override;
-    void answer(std::vector<PurchaseRecord> records);
-    // Keeps the next completions until releaseHeld().
-    void hold(bool held);
-    void releaseHeld();
-    std::vector<Query> queries();
-    void drain() { threads_.drain(); }
+    using Completion = std::function<void(std::vector<PurchaseRecord>, std::optional<std::string>)>;
+    void purchasesForAccount(std::int64_t account, const std::vector<std::string>& bundleIDs,
+                             Completion completion) override {
+        std::unique_lock lock(mutex_);
+        queries.emplace_back(account, bundleIDs);
+        if (hold) {
+            held_.push_back(std::move(completion));
+            return;
+        }
+        lock.unlock();
+        completion(records, std::nullopt);
+    }
+    void releaseHeld() {
+        std::vector<Completion> held;
+        {
+            std::lock_guard lock(mutex_);
+            held.swap(held_);
+        }
+        for (auto& completion : held) {
+            completion(records, std::nullopt);
+        }
+    }
+    // Set before use; `queries` read after.
+    std::vector<PurchaseRecord> records;
+    bool hold = false;
+    std::vector<std::pair<std::int64_t, std::vector<std::string>>> queries;
 
   private:
-    using Completion = std::function<void(std::vector<PurchaseRecord>, std::optional<std::string>)>;
     std::mutex mutex_;
-    std::vector<PurchaseRecord> records_;
-    bool hold_ = false;
     std::vector<Completion> held_;
-    std::vector<Query> queries_;
-    TaskThreads threads_;
 };
 
 }  // namespace qax::test

@@ -1,87 +1,147 @@
-// A warranty provider of the test's making: cache facts per serial number that the test sets,
-// downloads that answer at once or are held until the test releases them (from any thread),
-// and a log of the calls that change something. Thread-safe.
+// A warranty provider of the test's making: cache facts per serial number set by the test,
+// downloads answered at once or held until released (from any thread), and a log of the calls
+// that act. Thread-safe.
 #pragma once
 
+#include <algorithm>
 #include <atomic>
-#include <cstdint>
-#include <functional>
+#include <deque>
 #include <map>
 #include <mutex>
-#include <string>
-#include <vector>
 
 #include "agent/QAXAgentWarrantyProvider.h"
+#include "devices/QAXDeviceInfo.h"
 
 namespace qax::test {
 
 class FakeWarrantyProvider : public QAXAgentWarrantyProvider {
   public:
-    using DownloadCompletion = std::function<void(bool, std::shared_ptr<QAXWarranty>)>;
-
+    using InfoList = std::vector<std::shared_ptr<QAXDeviceInfo>>;
+    using Download = std::function<void(bool, std::shared_ptr<QAXWarranty>)>;
     struct Cache {
         std::shared_ptr<QAXWarranty> warranty;
-        std::optional<std::string> version;
-        std::optional<std::string> locale;
+        std::optional<std::string> version, locale;
         std::optional<Date> lastUpdated;
     };
 
-    std::vector<std::shared_ptr<QAXDeviceInfo>> refreshFollowupWithDeviceInfos(
-        const std::vector<std::shared_ptr<QAXDeviceInfo>>& deviceInfos) override;
-    std::vector<std::shared_ptr<QAXDeviceInfo>> refreshFollowupWithDeviceInfo(
-        const std::shared_ptr<QAXDeviceInfo>& deviceInfo) override;
-    void dismissFollowUpForSerialNumber(const std::string& serialNumber) override;
-    void dismissNotificationForSerialNumber(const std::string& serialNumber) override;
-    void downloadWarrantyForSerialNumber(const std::string& serialNumber,
-                                         DownloadCompletion completion) override;
-    std::shared_ptr<QAXWarranty> cachedWarrantyForSerialNumber(
-        const std::string& serialNumber) override;
-    std::optional<Date> lastUpdatedDateForSerialNumber(const std::string& serialNumber) override;
-    std::optional<std::string> cachedWarrantyVersionForSerialNumber(
-        const std::string& serialNumber) override;
-    std::optional<std::string> cachedWarrantyLocaleForSerialNumber(
-        const std::string& serialNumber) override;
+    InfoList refreshFollowupWithDeviceInfos(const InfoList& infos) override {
+        std::lock_guard lock(mutex_);
+        calls_.push_back("refresh " + std::to_string(infos.size()));
+        refreshed_.push_back(infos);
+        return {};
+    }
+    InfoList refreshFollowupWithDeviceInfo(const std::shared_ptr<QAXDeviceInfo>& info) override {
+        record("refreshOne " + info->device()->serialNumber().value_or(""));
+        return {};
+    }
+    void dismissFollowUpForSerialNumber(const std::string& s) override { record("dismiss " + s); }
+    void dismissNotificationForSerialNumber(const std::string& s) override {
+        record("dismissNotification " + s);
+    }
+    void downloadWarrantyForSerialNumber(const std::string& s, Download completion) override {
+        std::unique_lock lock(mutex_);
+        calls_.push_back("download " + s);
+        if (hold_) {
+            held_.emplace_back(s, std::move(completion));
+            return;
+        }
+        auto result = downloads_[s];
+        lock.unlock();
+        completion(result != nullptr, result);
+    }
+    std::shared_ptr<QAXWarranty> cachedWarrantyForSerialNumber(const std::string& s) override {
+        return cache(s).warranty;
+    }
+    std::optional<Date> lastUpdatedDateForSerialNumber(const std::string& s) override {
+        return cache(s).lastUpdated;
+    }
+    std::optional<std::string> cachedWarrantyVersionForSerialNumber(const std::string& s) override {
+        return cache(s).version;
+    }
+    std::optional<std::string> cachedWarrantyLocaleForSerialNumber(const std::string& s) override {
+        return cache(s).locale;
+    }
     std::shared_ptr<QAXWarranty> migrateLegacyCachedWarrantyIfNeededForSerialNumber(
-        const std::string& serialNumber) override;
+        const std::string& s) override {
+        record("migrateWarranty " + s);
+        return legacyWarranty;
+    }
     void migrateLegacyFollowUpIfNeededWithDeviceInfo(
-        const std::shared_ptr<QAXDeviceInfo>& deviceInfo) override;
-    double cachedWarrantyValidityDuration() override;
-    bool isSignedInToSkyvault() override;
-    std::int32_t migrationVersion() override;
-    void setMigrationVersion(std::int32_t version) override;
+        const std::shared_ptr<QAXDeviceInfo>& info) override {
+        record("migrateFollowUp " + info->device()->serialNumber().value_or("") +
+               (info->warranty() ? " with warranty" : ""));
+    }
+    double cachedWarrantyValidityDuration() override { return 86400; }
+    bool isSignedInToSkyvault() override { return signedIn; }
+    std::int32_t migrationVersion() override { return storedMigrationVersion; }
+    void setMigrationVersion(std::int32_t v) override {
+        record("setMigrationVersion " + std::to_string(v));
+        storedMigrationVersion = v;
+    }
 
-    void setCache(const std::string& serialNumber, Cache cache);
-    // What downloads of `serialNumber` answer (none: the download fails).
-    void setDownloadResult(const std::string& serialNumber, std::shared_ptr<QAXWarranty> warranty);
-    // While held, download completions wait for releaseDownloads().
-    void holdDownloads(bool hold);
-    // Completes up to `count` held downloads, in the order they were asked for; returns how
-    // many.
-    std::size_t releaseDownloads(std::size_t count = SIZE_MAX);
-    std::size_t heldDownloads();
+    void setCache(const std::string& s, Cache c) {
+        std::lock_guard lock(mutex_);
+        caches_[s] = std::move(c);
+    }
+    // What downloads of a serial number give (none: they fail).
+    void setDownloadResult(const std::string& s, std::shared_ptr<QAXWarranty> w) {
+        std::lock_guard lock(mutex_);
+        downloads_[s] = std::move(w);
+    }
+    void holdDownloads(bool hold) {
+        std::lock_guard lock(mutex_);
+        hold_ = hold;
+    }
+    // Completes up to `count` held downloads in the order they were asked for.
+    std::size_t releaseDownloads(std::size_t count = SIZE_MAX) {
+        std::vector<std::pair<Download, std::shared_ptr<QAXWarranty>>> due;
+        {
+            std::lock_guard lock(mutex_);
+            while (!held_.empty() && due.size() < count) {
+                due.emplace_back(std::move(held_.front().second), downloads_[held_.front().first]);
+                held_.pop_front();
+            }
+        }
+        for (auto& [completion, result] : due) {
+            completion(result != nullptr, result);
+        }
+        return due.size();
+    }
+    std::size_t heldDownloads() {
+        std::lock_guard lock(mutex_);
+        return held_.size();
+    }
+    // "download S", "refresh N", "refreshOne S", "dismiss S", ... in call order.
+    std::vector<std::string> calls() {
+        std::lock_guard lock(mutex_);
+        return calls_;
+    }
+    std::vector<InfoList> refreshedLists() {
+        std::lock_guard lock(mutex_);
+        return refreshed_;
+    }
 
-    // "download SERIAL", "refresh N", "refreshOne SERIAL", "dismiss SERIAL",
-    // "dismissNotification SERIAL", "migrateWarranty SERIAL", "migrateFollowUp SERIAL",
-    // "setMigrationVersion N", in call order.
-    std::vector<std::string> calls();
-    std::vector<std::vector<std::shared_ptr<QAXDeviceInfo>>> refreshedLists();
-
-    std::atomic<double> validity{86400};
     std::atomic<bool> signedIn{true};
     std::atomic<std::int32_t> storedMigrationVersion{0};
-    // What the legacy-cache migration finds; set before use.
-    std::shared_ptr<QAXWarranty> legacyWarranty;
+    std::shared_ptr<QAXWarranty> legacyWarranty;  // set before use
 
   private:
-    void record(std::string call);
+    void record(std::string call) {
+        std::lock_guard lock(mutex_);
+        calls_.push_back(std::move(call));
+    }
+    Cache cache(const std::string& s) {
+        std::lock_guard lock(mutex_);
+        return caches_[s];
+    }
 
     std::mutex mutex_;
     std::map<std::string, Cache> caches_;
     std::map<std::string, std::shared_ptr<QAXWarranty>> downloads_;
     bool hold_ = false;
-    std::vector<std::pair<std::string, DownloadCompletion>> held_;
+    std::deque<std::pair<std::string, Download>> held_;
     std::vector<std::string> calls_;
-    std::vector<std::vector<std::shared_ptr<QAXDeviceInfo>>> refreshed_;
+    std::vector<InfoList> refreshed_;
 };
 
 }  // namespace qax::test

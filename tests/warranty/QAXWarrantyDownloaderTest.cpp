@@ -17,7 +17,6 @@
 #include "fakes/FakeAgentFactory.h"
 #include "fakes/TestHttpsServer.h"
 #include "fakes/TestPlatform.h"
-#include "platform/HttpClient.h"
 #include "platform/PreferenceStore.h"
 #include "platform/QAXSettings.h"
 #include "platform/host/CurlHttpClient.h"
@@ -40,34 +39,6 @@ constexpr const char* kCaller = "com.example.caller";
 Value versionList(int low, int high) {
     return Value(Value::Dictionary{{"LowServerVersion", low}, {"HighServerVersion", high}});
 }
-
-// Remembers what was sent; the real session does the sending.
-class RecordingHttpClient : public HttpClient {
-  public:
-    explicit RecordingHttpClient(std::shared_ptr<HttpClient> target) : target_(std::move(target)) {}
-    void send(const HttpRequest& request, std::function<void(HttpResult)> completion) override {
-        {
-            std::lock_guard lock(mutex_);
-            sent_.push_back(request);
-        }
-        target_->send(request, std::move(completion));
-    }
-    std::vector<HttpRequest> posts() {
-        std::lock_guard lock(mutex_);
-        std::vector<HttpRequest> out;
-        for (const auto& r : sent_) {
-            if (r.method() == "POST") {
-                out.push_back(r);
-            }
-        }
-        return out;
-    }
-
-  private:
-    std::shared_ptr<HttpClient> target_;
-    std::mutex mutex_;
-    std::vector<HttpRequest> sent_;
-};
 
 class QAXWarrantyDownloaderTest : public ::testing::Test {
   protected:
@@ -111,9 +82,8 @@ class QAXWarrantyDownloaderTest : public ::testing::Test {
 
         dispatcher = std::make_shared<AsioDispatcher>(2, 2);
         tp.platform->dispatcher = dispatcher;
-        http = std::make_shared<RecordingHttpClient>(std::make_shared<CurlHttpClient>(
-            CurlHttpClient::optionsForPlatformRoot(tp.platform->platformRoot)));
-        tp.platform->http = http;
+        tp.platform->http = std::make_shared<CurlHttpClient>(
+            CurlHttpClient::optionsForPlatformRoot(tp.platform->platformRoot));
         accounts = std::make_shared<test::FakeAccountStore>();
         tp.platform->accounts = accounts;
         tp.platform->identity = std::make_shared<test::FakeIdentityAccountManager>();
@@ -175,13 +145,14 @@ class QAXWarrantyDownloaderTest : public ::testing::Test {
                 prefs().objectForKey(h + "_CachedWarrantyLocale"),
                 prefs().objectForKey(h + "_CachedWarrantyVersion")};
     }
-    void seedCache(const std::string& serial) {
+    CacheState seedCache(const std::string& serial) {
         QAXWarranty::warrantyWithDictionary(tp.platform, Value(Value::Dictionary{{"old", true}}))
             ->cacheWarranty(serial);
         const std::string h = sha256Hash(serial);
         prefs().setObject(h + "_CachedWarrantyLastUpdatedDate", Value(Date(1000)));
         prefs().setObject(h + "_CachedWarrantyLocale", "fr_FR");
         prefs().setObject(h + "_CachedWarrantyVersion", "1");
+        return cacheState(serial);
     }
 
   private:
@@ -198,7 +169,6 @@ class QAXWarrantyDownloaderTest : public ::testing::Test {
     test::TestHttpsServer server;
     test::TestPlatform tp;
     std::shared_ptr<AsioDispatcher> dispatcher;
-    std::shared_ptr<RecordingHttpClient> http;
     std::shared_ptr<test::FakeAccountStore> accounts;
 };
 
@@ -225,8 +195,7 @@ TEST_F(QAXWarrantyDownloaderTest, OnlyUnauthorizedIsRetriedAndFailuresKeepTheCac
     };
     for (auto& row : rows) {
         SCOPED_TRACE(row.name);
-        seedCache(kThisDevice);
-        const CacheState before = cacheState(kThisDevice);
+        const CacheState before = seedCache(kThisDevice);
         const auto renewalsBefore = accounts->renewals().size();
         const auto postsBefore = received().size();
         tp.log->clear();
@@ -276,15 +245,11 @@ TEST_F(QAXWarrantyDownloaderTest, ThisDeviceAndOtherDevicesUseTheirOwnEndpoints)
     }
     EXPECT_EQ(*parseJson(got[0].body)->find("serialNumber"), Value(kThisDevice));
     EXPECT_EQ(*parseJson(got[1].body)->find("serialNumber"), Value("WATCH-1"));
-    for (const auto& request : http->posts()) {
-        EXPECT_EQ(request.timeoutSeconds(), 30);
-    }
 }
 
-TEST_F(QAXWarrantyDownloaderTest, UnsupportedServerVersionSendsNothing) {
+TEST_F(QAXWarrantyDownloaderTest, NothingIsSentForAnUnsupportedServerOrAnUnsignedRequest) {
     constexpr const char* kSkipped = "Warranty download skipped server due to server version";
-    seedCache("WATCH-1");
-    const CacheState before = cacheState("WATCH-1");
+    const CacheState before = seedCache("WATCH-1");
 
     serveList(versionList(5, 6));
     Result skipped = download("WATCH-1");
@@ -299,6 +264,14 @@ TEST_F(QAXWarrantyDownloaderTest, UnsupportedServerVersionSendsNothing) {
     EXPECT_TRUE(download("WATCH-1").success);
     EXPECT_EQ(received().size(), 1u);
     EXPECT_EQ(tp.log->count(kSkipped), 1);
+
+    // A request that cannot be signed is not sent.
+    accounts->primary = nullptr;
+    const CacheState signedOut = seedCache("WATCH-1");
+    EXPECT_FALSE(download("WATCH-1").success);
+    EXPECT_EQ(received().size(), 1u);
+    EXPECT_EQ(tp.log->count("Unable to load sign request, failing warranty download"), 1);
+    EXPECT_EQ(cacheState("WATCH-1"), signedOut);
 }
 
 TEST_F(QAXWarrantyDownloaderTest, LocalFilesPreferThePerSerialFile) {
@@ -344,8 +317,7 @@ TEST_F(QAXWarrantyDownloaderTest, LocalFilesPreferThePerSerialFile) {
             test::writeFile(dir / "w.WATCH-1.plist", *toXmlPlist(*row.serialFile));
         }
         prefs().setObject(settings::kWearablesWarrantyURL, row.url);
-        seedCache("WATCH-1");
-        const CacheState before = cacheState("WATCH-1");
+        const CacheState before = seedCache("WATCH-1");
         tp.log->clear();
 
         Result result = download("WATCH-1");
