@@ -373,7 +373,9 @@ void QAXAgent::getAllDeviceInfosUsingPolicy(QAXWarrantyPolicy policy, bool updat
     };
     auto results = std::make_shared<Results>();
     auto self = shared_from_this();
-    for (const auto& [serial, device] : deviceProvider()->allDevices()) {
+    for (const auto& entry : deviceProvider()->allDevices()) {
+        const std::string& serial = entry.first;
+        std::shared_ptr<QAXDevice> device = entry.second;
         group_.enter();
         getWarrantyUsingPolicy(policy, device ? device->serialNumber().value_or(serial) : serial,
                                [self, results, device](std::shared_ptr<QAXWarranty> warranty) {

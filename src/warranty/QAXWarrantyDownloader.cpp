@@ -37,8 +37,6 @@ constexpr const char* kLastUpdatedDateKeySuffix = "_CachedWarrantyLastUpdatedDat
 constexpr const char* kLocaleKeySuffix = "_CachedWarrantyLocale";
 constexpr const char* kVersionKeySuffix = "_CachedWarrantyVersion";
 
-constexpr const char* kFileScheme = "file://";
-
 // The serial number of the device the agent runs on. The devices manager keeps nothing
 // between calls, so one made on this download's platform answers as the shared one does.
 std::optional<std::string> defaultDeviceSerialNumber(const std::shared_ptr<Platform>& platform) {
