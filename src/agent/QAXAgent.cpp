@@ -1,16 +1,62 @@
 #include "agent/QAXAgent.h"
 
+#include "agent/QAXAgentDefaultWarrantyProvider.h"
 #include "core/Log.h"
 #include "devices/QAXDevicesManager.h"
+#include "platform/AgentFactory.h"
+#include "platform/LocaleInfo.h"
 #include "platform/Platform.h"
+#include "platform/PreferenceStore.h"
 #include "platform/QAXUtilities.h"
+#include "scheduling/QAXSchedulerActivityDelegate.h"
+#include "support/QAXVelmoraSupportManager.h"
 #include "warranty/QAXServerVersionUtilities.h"
+#include "warranty/QAXWarranty.h"
 
 namespace qax {
 namespace {
 
 constexpr const char* kPolicyQueueName = "com.velmora.kestova.qaxagent.policyqueue";
 constexpr const char* kPreferencesBundleID = "com.velmora.Preferences";
+
+// The cache layout a cached warranty must have been written with to be used.
+constexpr const char* kCurrentCacheVersion = "2";
+constexpr std::int32_t kCurrentMigrationVersion = 2;
+
+constexpr const char* kPostUpgradeActivityCompletedKey = "PostUpgradeActivityCompleted";
+constexpr const char* kPostUpgradeOutreachDelayKey = "PostUpgradeOutreachDelay";
+constexpr const char* kInitialOutreachActivityScheduledKey = "InitialOutreachActivityScheduled";
+constexpr const char* kPairedWatchesSerialNumbersKey = "PairedWatchesSerialNumbers";
+constexpr const char* kPairedBluetoothDevicesSerialNumbersKey =
+    "PairedBluetoothDevicesSerialNumbers";
+
+constexpr const char* kUnknownDeviceName = "<unknown>";
+
+// The printed form of a list of device infos in logs.
+std::string describeDeviceInfos(const std::vector<std::shared_ptr<QAXDeviceInfo>>& infos) {
+    if (infos.empty()) {
+        return "(\n)";
+    }
+    std::string text = "(\n";
+    for (std::size_t i = 0; i < infos.size(); ++i) {
+        text += "    " + (infos[i] ? infos[i]->description() : std::string("(null)"));
+        text += i + 1 < infos.size() ? ",\n" : "\n";
+    }
+    return text + ")";
+}
+
+// The value a substitution dictionary holds for `serialNumber`, when it holds a string.
+std::optional<std::string> substitute(const std::optional<Value::Dictionary>& dictionary,
+                                      const std::string& serialNumber) {
+    if (!dictionary) {
+        return std::nullopt;
+    }
+    auto it = dictionary->find(serialNumber);
+    if (it == dictionary->end() || !it->second.isString()) {
+        return std::nullopt;
+    }
+    return *it->second.asString();
+}
 
 }  // namespace
 
@@ -21,9 +67,8 @@ std::shared_ptr<QAXAgent> QAXAgent::initWithCallingProcessBundleID(
                       "-[QAXAgent initWithCallingProcessBundleID:]");
         callingProcessBundleID = kPreferencesBundleID;
     }
-    // The default warranty provider, made with the calling process's identifier, joins here.
-    // Until then the agent has no warranty provider and serves devices only.
-    std::shared_ptr<QAXAgentWarrantyProvider> warrantyProvider;
+    auto warrantyProvider = QAXAgentDefaultWarrantyProvider::initWithCallingProcessBundleID(
+        platform, *callingProcessBundleID);
     auto agent = initWithWarrantyProvider(platform, std::move(warrantyProvider),
                                           QAXDevicesManager::sharedManager(platform));
     agent->callingProcessBundleID_ = std::move(*callingProcessBundleID);
@@ -65,40 +110,179 @@ void QAXAgent::setDeviceProvider(std::shared_ptr<QAXAgentDeviceProvider> provide
     deviceProvider_ = std::move(provider);
 }
 
-void QAXAgent::logUnavailable(const char* operation) {
-    qaxLog().error("%s is not available in this build", operation);
+void QAXAgent::performMigrationIfNeeded() {
+    auto provider = warrantyProvider();
+    if (!provider || provider->migrationVersion() > 1) {
+        return;
+    }
+    auto device = deviceProvider()->defaultDevice();
+    std::shared_ptr<QAXWarranty> warranty;
+    if (device && device->serialNumber()) {
+        warranty =
+            provider->migrateLegacyCachedWarrantyIfNeededForSerialNumber(*device->serialNumber());
+    }
+    provider->migrateLegacyFollowUpIfNeededWithDeviceInfo(
+        QAXDeviceInfo::deviceInfoWithDevice(device, warranty));
+    provider->setMigrationVersion(kCurrentMigrationVersion);
 }
 
-// Operations 1-5 and 9-11 need the scheduler, outreach activity, support-application
-// manager and warranty policy rules, which join the agent later. Until then each answers the
-// empty result the protocol uses for failure and logs why; the IPC interface does not route
-// them here and tells clients "unsupported operation" instead.
+void QAXAgent::getWarrantyUsingPolicy(QAXWarrantyPolicy policy,
+                                      std::function<void(std::shared_ptr<QAXWarranty>)> reply) {
+    auto device = deviceProvider()->defaultDevice();
+    const auto serialNumber = device ? device->serialNumber() : std::nullopt;
+    if (!serialNumber) {
+        reply(nullptr);
+        return;
+    }
+    getWarrantyUsingPolicy(policy, *serialNumber, std::move(reply));
+}
+
+void QAXAgent::getWarrantyUsingPolicy(QAXWarrantyPolicy policy, const std::string& serialNumber,
+                                      std::function<void(std::shared_ptr<QAXWarranty>)> reply) {
+    static constexpr const char* kOperation =
+        "-[QAXAgent getWarrantyUsingPolicy:serialNumber:withReply:]";
+    qaxLog().info("getting warranty using policy %@: %lu", serialNumber,
+                  static_cast<std::uint64_t>(policy));
+
+    auto provider = warrantyProvider();
+    if (!provider) {
+        reply(nullptr);
+        return;
+    }
+    bool cacheValid = false;
+    std::shared_ptr<QAXWarranty> cached = provider->cachedWarrantyForSerialNumber(serialNumber);
+    if (!cached) {
+        qaxLog().info("no cached warranty : %@", serialNumber);
+    } else {
+        qaxLog().info("Has cached warranty : %@", serialNumber);
+        const auto version = provider->cachedWarrantyVersionForSerialNumber(serialNumber);
+        const auto locale = provider->cachedWarrantyLocaleForSerialNumber(serialNumber);
+        const std::string currentLocale = platform_->locale->preferredLocaleIdentifier();
+        if (version != kCurrentCacheVersion) {
+            qaxLog().info(
+                "cached warranty is of outdated version '%@', current version is '%@', consider "
+                "it invalid",
+                version, kCurrentCacheVersion);
+        } else if (locale != currentLocale) {
+            qaxLog().info(
+                "cached warranty is for locale '%@', system is now in '%@', consider it invalid",
+                locale, currentLocale);
+        } else if (!provider->isSignedInToSkyvault()) {
+            qaxLog().info("user is signed out of Skyvault, cached warranty not allowed");
+        } else {
+            qaxLog().info(
+                "cached warranty is for locale ('%@') and version ('%@') match system, consider "
+                "it valid",
+                locale, version);
+            cacheValid = true;
+        }
+    }
+
+    bool shouldDownload = false;
+    if (policy == QAXWarrantyPolicyForceDownload) {
+        cacheValid = false;
+        shouldDownload = true;
+    } else if (policy == QAXWarrantyPolicyDefault && !cacheValid) {
+        qaxLog().info("Default policy query: cached warranty is invalid, refresh it");
+        shouldDownload = true;
+    } else if (policy == QAXWarrantyPolicyDefault) {
+        qaxLog().info("Default policy query: cached warranty is valid, examine expiration date");
+        const auto lastUpdated = provider->lastUpdatedDateForSerialNumber(serialNumber);
+        if (!lastUpdated) {
+            qaxLog().info("warranty validity expired, refresh it");
+            shouldDownload = true;
+        } else {
+            const double remaining = lastUpdated->timeIntervalSince(platform_->clock->now()) +
+                                     provider->cachedWarrantyValidityDuration();
+            if (remaining > 0) {
+                qaxLog().info("warranty valid for %.02f seconds", remaining);
+            } else {
+                // 0 - remaining rather than -remaining: exactly expired prints 0.00, not -0.00.
+                qaxLog().info("warranty validity expired %.02f seconds ago, refresh it",
+                              0.0 - remaining);
+                shouldDownload = true;
+            }
+        }
+    }
+    qaxLog().info("%s: shouldDownloadWarranty: %d", kOperation, shouldDownload ? 1 : 0);
+
+    auto finish = [serialNumber, cached, cacheValid,
+                   reply = std::move(reply)](std::shared_ptr<QAXWarranty> downloaded) {
+        qaxLog().info("getWarrantyUsingPolicy completionBlock %{private}@ : %d", serialNumber,
+                      downloaded ? 1 : 0);
+        if (downloaded) {
+            reply(std::move(downloaded));
+        } else {
+            reply(cacheValid ? cached : nullptr);
+        }
+    };
+    if (!shouldDownload) {
+        finish(nullptr);
+        return;
+    }
+    provider->downloadWarrantyForSerialNumber(
+        serialNumber, [finish = std::move(finish)](bool, std::shared_ptr<QAXWarranty> warranty) {
+            finish(std::move(warranty));
+        });
+}
 
 void QAXAgent::scheduleOutreach(QAXBoolReply reply) {
-    logUnavailable("-[QAXAgent scheduleOutreachWithReply:]");
-    reply(false);
+    scheduleOutreachAfter(0, std::move(reply));
 }
 
-void QAXAgent::scheduleOutreachAfter(double, QAXBoolReply reply) {
-    logUnavailable("-[QAXAgent scheduleOutreachAfter:withReply:]");
-    reply(false);
+void QAXAgent::scheduleOutreachAfter(double delay, QAXBoolReply reply) {
+    if (platform_->agentFactory) {
+        platform_->agentFactory->scheduleActivityForDate(kQAXOutreachActivityIdentifier,
+                                                         platform_->clock->now().byAdding(delay));
+    } else {
+        qaxLog().error("no activity scheduling in this process; outreach not scheduled");
+    }
+    reply(true);
 }
 
 void QAXAgent::velmoraAccountAdded(QAXBoolReply reply) {
-    logUnavailable("-[QAXAgent velmoraAccountAddedWithReply:]");
-    reply(false);
+    static constexpr const char* kOperation = "-[QAXAgent velmoraAccountAddedWithReply:]";
+    PreferenceStore& preferences = *platform_->preferences;
+    if (!preferences.boolForKey(kPostUpgradeActivityCompletedKey)) {
+        qaxLog().info("%s: Skipped scheduling/downloading new warranty", kOperation);
+        reply(false);
+        return;
+    }
+    const double delay = preferences.doubleForKey(kPostUpgradeOutreachDelayKey);
+    if (preferences.boolForKey(kInitialOutreachActivityScheduledKey)) {
+        qaxLog().info("%s: New warranty to be downloaded after: %f", kOperation, delay);
+        // The agent stays alive for the delay: the client is waiting for this reply.
+        auto self = shared_from_this();
+        platform_->dispatcher->backgroundQueue()->postDelayed(
+            [self, reply = std::move(reply)]() {
+                self->getAllDeviceInfosUsingPolicy(
+                    QAXWarrantyPolicyForceDownload, false,
+                    [reply](std::vector<std::shared_ptr<QAXDeviceInfo>>) { reply(true); });
+            },
+            delay);
+        return;
+    }
+    qaxLog().info("%s: Outreach to be scheduled after: %f", kOperation, delay);
+    scheduleOutreachAfter(delay, std::move(reply));
+    preferences.setObject(kInitialOutreachActivityScheduledKey, Value(true));
 }
 
 void QAXAgent::checkIsAvailableInStore(
-    const std::string&, std::function<void(std::optional<Value::Dictionary>)> reply) {
-    logUnavailable("-[QAXAgent checkIsAvailableInStore:withReply:]");
-    reply(std::nullopt);
+    const std::string& bundleIdentifier,
+    std::function<void(std::optional<Value::Dictionary>)> reply) {
+    qaxLog().info("Checking for %@ in the Marketa", bundleIdentifier);
+    QAXVelmoraSupportManager(platform_).checkIsAvailableInStore(bundleIdentifier, std::move(reply));
 }
 
-void QAXAgent::appSupportAvailability(const std::string&,
+void QAXAgent::appSupportAvailability(const std::string& argument,
                                       std::function<void(Value::Dictionary)> reply) {
-    logUnavailable("-[QAXAgent appSupportAvailability:withReply:]");
-    reply({});
+    qaxLog().info("Availability for %@", argument);
+    // The purchase check waits for the purchase history; that wait must not hold the
+    // connection's queue.
+    platform_->dispatcher->blockingQueue()->post(
+        [platform = platform_, argument, reply = std::move(reply)]() {
+            QAXVelmoraSupportManager(platform).appSupportAvailability(argument, reply);
+        });
 }
 
 void QAXAgent::readWebURLOverride(std::function<void(std::optional<Value>)> reply) {
@@ -124,28 +308,107 @@ void QAXAgent::pairedDevices(QAXDeviceListReply reply) {
     reply(std::move(devices));
 }
 
-void QAXAgent::getDefaultDeviceInfoUsingPolicy(QAXWarrantyPolicy, QAXDeviceInfoReply reply) {
-    logUnavailable("-[QAXAgent getDefaultDeviceInfoUsingPolicy:withReply:]");
-    reply(nullptr);
+void QAXAgent::getDefaultDeviceInfoUsingPolicy(QAXWarrantyPolicy policy, QAXDeviceInfoReply reply) {
+    auto device = deviceProvider()->defaultDevice();
+    auto self = shared_from_this();
+    getWarrantyUsingPolicy(
+        policy, [self, device, reply = std::move(reply)](std::shared_ptr<QAXWarranty> warranty) {
+            auto info = QAXDeviceInfo::deviceInfoWithDevice(device, std::move(warranty));
+            qaxLog().info("getDefaultDeviceInfoUsingPolicy for device: '%@'", *info);
+            reply(info);
+            if (auto provider = self->warrantyProvider()) {
+                provider->refreshFollowupWithDeviceInfo(info);
+            }
+        });
 }
 
-void QAXAgent::getDeviceInfoForSerialNumber(const std::string&, QAXWarrantyPolicy,
-                                            QAXDeviceInfoReply reply) {
-    logUnavailable("-[QAXAgent getDeviceInfoForSerialNumber:usingPolicy:withReply:]");
-    reply(nullptr);
+void QAXAgent::getDeviceInfoForSerialNumber(const std::string& requestedSerialNumber,
+                                            QAXWarrantyPolicy policy, QAXDeviceInfoReply reply) {
+    std::string serialNumber = requestedSerialNumber;
+    // Engineers point a device at another device's coverage; this holds on every build.
+    PreferenceStore& preferences = *platform_->preferences;
+    const auto watches = preferences.dictionaryForKey(kPairedWatchesSerialNumbersKey);
+    const auto accessories = preferences.dictionaryForKey(kPairedBluetoothDevicesSerialNumbersKey);
+    if (watches || accessories) {
+        auto replacement = substitute(watches, serialNumber);
+        if (!replacement) {
+            replacement = substitute(accessories, serialNumber);
+        }
+        qaxLog().debug("serialNumberOverride for Serial Number: %@ with serial: %@", serialNumber,
+                       replacement);
+        if (replacement) {
+            qaxLog().debug("Override Serial Number: %@ found for SN: %@", *replacement,
+                           serialNumber);
+            serialNumber = *replacement;
+        }
+    }
+    auto self = shared_from_this();
+    getWarrantyUsingPolicy(
+        policy, serialNumber,
+        [self, serialNumber, reply = std::move(reply)](std::shared_ptr<QAXWarranty> warranty) {
+            std::shared_ptr<QAXDevice> device;
+            auto devices = self->deviceProvider()->allDevices();
+            if (auto it = devices.find(serialNumber); it != devices.end()) {
+                device = it->second;
+            }
+            if (!device) {
+                device = QAXDevice::deviceWithName(kUnknownDeviceName, serialNumber, std::nullopt,
+                                                   QAXDeviceTypeOther);
+            }
+            auto info = QAXDeviceInfo::deviceInfoWithDevice(device, std::move(warranty));
+            qaxLog().info("getDeviceInfoForSerialNumber for device: '%@'", *info);
+            reply(info);
+            if (auto provider = self->warrantyProvider()) {
+                provider->refreshFollowupWithDeviceInfo(info);
+            }
+        });
 }
 
-void QAXAgent::getAllDeviceInfosUsingPolicy(QAXWarrantyPolicy, bool, QAXDeviceInfoListReply reply) {
-    logUnavailable("-[QAXAgent getAllDeviceInfosUsingPolicy:updateFollowUps:withReply:]");
-    reply({});
+void QAXAgent::getAllDeviceInfosUsingPolicy(QAXWarrantyPolicy policy, bool updateFollowUps,
+                                            QAXDeviceInfoListReply reply) {
+    // Answers of one call, appended from whichever threads the downloads complete on.
+    struct Results {
+        std::mutex mutex;
+        std::vector<std::shared_ptr<QAXDeviceInfo>> infos;
+    };
+    auto results = std::make_shared<Results>();
+    auto self = shared_from_this();
+    for (const auto& entry : deviceProvider()->allDevices()) {
+        const std::string& serial = entry.first;
+        std::shared_ptr<QAXDevice> device = entry.second;
+        group_.enter();
+        getWarrantyUsingPolicy(policy, device ? device->serialNumber().value_or(serial) : serial,
+                               [self, results, device](std::shared_ptr<QAXWarranty> warranty) {
+                                   auto info = QAXDeviceInfo::deviceInfoWithDevice(
+                                       device, std::move(warranty));
+                                   {
+                                       std::lock_guard lock(results->mutex);
+                                       results->infos.push_back(std::move(info));
+                                   }
+                                   self->group_.leave();
+                               });
+    }
+    // The counter is the agent's: overlapping calls on one agent all wait for every query.
+    group_.notify(policyLookupQueue_, [self, results, updateFollowUps, reply = std::move(reply)]() {
+        std::vector<std::shared_ptr<QAXDeviceInfo>> infos;
+        {
+            std::lock_guard lock(results->mutex);
+            infos = results->infos;
+        }
+        qaxLog().info("getAllDeviceInfosUsingPolicy: '%@'", describeDeviceInfos(infos));
+        if (updateFollowUps) {
+            if (auto provider = self->warrantyProvider()) {
+                provider->refreshFollowupWithDeviceInfos(infos);
+            }
+        }
+        reply(std::move(infos));
+    });
 }
 
 void QAXAgent::dismissFollowUpForSerialNumber(const std::string& serialNumber,
                                               QAXBoolReply completion) {
     if (auto provider = warrantyProvider()) {
         provider->dismissFollowUpForSerialNumber(serialNumber);
-    } else {
-        logUnavailable("-[QAXAgent dismissFollowUpForSerialNumber:completion:]");
     }
     completion(true);
 }
@@ -154,8 +417,6 @@ void QAXAgent::dismissNotificationForSerialNumber(const std::string& serialNumbe
                                                   QAXBoolReply completion) {
     if (auto provider = warrantyProvider()) {
         provider->dismissNotificationForSerialNumber(serialNumber);
-    } else {
-        logUnavailable("-[QAXAgent dismissNotificationForSerialNumber:completion:]");
     }
     completion(true);
 }

@@ -3,7 +3,9 @@
 // through its warranty provider and devices only through its device provider. Requests run on
 // the caller's thread; the providers may be swapped while requests run (each step uses the
 // provider it reads then, under a small lock). The all-devices join delivers on the agent's
-// own serial queue.
+// own serial queue (appends to its result are serialised by a lock of the call), the
+// account-added download on the background queue, the support-application check on the
+// blocking queue.
 #pragma once
 
 #include <memory>
@@ -46,6 +48,18 @@ class QAXAgent : public QAXAgentProtocol,
     // The process on whose behalf this agent works (set by initWithCallingProcessBundleID).
     const std::string& callingProcessBundleID() const { return callingProcessBundleID_; }
 
+    // Moves the legacy single cached warranty and follow-up of the default device into the
+    // current layout, once (skipped once "QAXMigrationVersion" is past 1). Synchronous.
+    void performMigrationIfNeeded();
+    // The warranty of `serialNumber` under `policy`: cache, download or none, by the policy
+    // rules. Without a download the reply runs before this returns; with one, on the
+    // download's completion thread.
+    void getWarrantyUsingPolicy(QAXWarrantyPolicy policy, const std::string& serialNumber,
+                                std::function<void(std::shared_ptr<QAXWarranty>)> reply);
+    // The same for the default device.
+    void getWarrantyUsingPolicy(QAXWarrantyPolicy policy,
+                                std::function<void(std::shared_ptr<QAXWarranty>)> reply);
+
     // QAXAgentProtocol.
     void scheduleOutreach(QAXBoolReply reply) override;
     void scheduleOutreachAfter(double delay, QAXBoolReply reply) override;
@@ -70,9 +84,6 @@ class QAXAgent : public QAXAgentProtocol,
                                             QAXBoolReply completion) override;
 
   private:
-    // Logs that an operation whose collaborators have not joined the agent yet was asked for.
-    static void logUnavailable(const char* operation);
-
     const std::shared_ptr<Platform> platform_;
     std::shared_ptr<TaskRunner> policyLookupQueue_;
     JoinCounter group_;

@@ -1,5 +1,6 @@
 #include "agent/QAXAgentRemoteInterface.h"
 
+#include <cmath>
 #include <functional>
 #include <string_view>
 #include <vector>
@@ -10,19 +11,25 @@ namespace qax {
 namespace {
 
 constexpr const char* kUnknownOperation = "unknown operation";
-constexpr const char* kUnsupportedOperation = "unsupported operation";
 constexpr const char* kNotAnAgent = "the exported object does not serve this interface";
 
-enum class Arg { String, Unsigned, Double, Bool };
+// Serial numbers are short; a longer one is a client's mistake or an attack, and would only
+// travel into file names, preference keys and requests.
+constexpr std::size_t kMaxSerialNumberLength = 256;
+constexpr std::size_t kMaxStringLength = 4096;
+
+enum class Arg { SerialNumber, String, Unsigned, Double, Bool };
 
 const char* argName(Arg a) {
     switch (a) {
+        case Arg::SerialNumber:
+            return "serial number of 1 to 256 characters";
         case Arg::String:
-            return "string";
+            return "string of at most 4096 characters";
         case Arg::Unsigned:
             return "unsigned integer";
         case Arg::Double:
-            return "number";
+            return "finite number";
         case Arg::Bool:
             return "boolean";
     }
@@ -31,12 +38,17 @@ const char* argName(Arg a) {
 
 bool argMatches(Arg a, const Value& v) {
     switch (a) {
+        case Arg::SerialNumber: {
+            const std::string* s = v.asString();
+            return s && !s->empty() && s->size() <= kMaxSerialNumberLength &&
+                   s->find('\0') == std::string::npos;
+        }
         case Arg::String:
-            return v.isString();
+            return v.isString() && v.asString()->size() <= kMaxStringLength;
         case Arg::Unsigned:
             return v.isInteger() && *v.asInteger() >= 0;
         case Arg::Double:
-            return v.isNumber();
+            return v.isNumber() && std::isfinite(*v.asDouble());
         case Arg::Bool:
             return v.isBool();
     }
@@ -48,25 +60,67 @@ using Call = std::function<void(QAXAgentProtocol&, const Value::Array&, RemoteRe
 struct Operation {
     std::string_view name;
     std::vector<Arg> args;
-    // Empty while the operation has not joined the agent.
     Call call;
 };
 
-Value encodeDevice(const std::shared_ptr<QAXDevice>& device) {
-    return device ? device->encode() : Value();
+const std::string& stringArg(const Value::Array& args, std::size_t i) {
+    return *args[i].asString();
+}
+
+QAXWarrantyPolicy policyArg(const Value::Array& args, std::size_t i) {
+    return static_cast<QAXWarrantyPolicy>(*args[i].asInteger());
 }
 
 RemoteReply replyOf(const std::shared_ptr<QAXDevice>& device) {
     return device ? RemoteReply::of(device->encode()) : RemoteReply::none();
 }
 
+RemoteReply replyOf(const std::shared_ptr<QAXDeviceInfo>& info) {
+    return info ? RemoteReply::of(info->encode()) : RemoteReply::none();
+}
+
+QAXBoolReply boolReply(RemoteReplyHandler reply) {
+    return [reply = std::move(reply)](bool value) { reply(RemoteReply::of(Value(value))); };
+}
+
+QAXDeviceInfoReply deviceInfoReply(RemoteReplyHandler reply) {
+    return
+        [reply = std::move(reply)](std::shared_ptr<QAXDeviceInfo> info) { reply(replyOf(info)); };
+}
+
 const std::vector<Operation>& operations() {
     static const std::vector<Operation> table = {
-        {"scheduleOutreachWithReply:", {}, {}},
-        {"scheduleOutreachAfter:withReply:", {Arg::Double}, {}},
-        {"velmoraAccountAddedWithReply:", {}, {}},
-        {"checkIsAvailableInStore:withReply:", {Arg::String}, {}},
-        {"appSupportAvailability:withReply:", {Arg::String}, {}},
+        {"scheduleOutreachWithReply:",
+         {},
+         [](QAXAgentProtocol& agent, const Value::Array&, RemoteReplyHandler reply) {
+             agent.scheduleOutreach(boolReply(std::move(reply)));
+         }},
+        {"scheduleOutreachAfter:withReply:",
+         {Arg::Double},
+         [](QAXAgentProtocol& agent, const Value::Array& args, RemoteReplyHandler reply) {
+             agent.scheduleOutreachAfter(*args[0].asDouble(), boolReply(std::move(reply)));
+         }},
+        {"velmoraAccountAddedWithReply:",
+         {},
+         [](QAXAgentProtocol& agent, const Value::Array&, RemoteReplyHandler reply) {
+             agent.velmoraAccountAdded(boolReply(std::move(reply)));
+         }},
+        {"checkIsAvailableInStore:withReply:",
+         {Arg::String},
+         [](QAXAgentProtocol& agent, const Value::Array& args, RemoteReplyHandler reply) {
+             agent.checkIsAvailableInStore(
+                 stringArg(args, 0), [reply](std::optional<Value::Dictionary> answer) {
+                     reply(answer ? RemoteReply::of(Value(std::move(*answer)))
+                                  : RemoteReply::none());
+                 });
+         }},
+        {"appSupportAvailability:withReply:",
+         {Arg::String},
+         [](QAXAgentProtocol& agent, const Value::Array& args, RemoteReplyHandler reply) {
+             agent.appSupportAvailability(stringArg(args, 0), [reply](Value::Dictionary answer) {
+                 reply(RemoteReply::of(Value(std::move(answer))));
+             });
+         }},
         {"readWebURLOverride:",
          {},
          [](QAXAgentProtocol& agent, const Value::Array&, RemoteReplyHandler reply) {
@@ -87,18 +141,50 @@ const std::vector<Operation>& operations() {
                  Value::Array archived;
                  for (const auto& d : devices) {
                      if (d) {
-                         archived.push_back(encodeDevice(d));
+                         archived.push_back(d->encode());
                      }
                  }
                  reply(RemoteReply::of(Value(std::move(archived))));
              });
          }},
-        {"getDefaultDeviceInfoUsingPolicy:withReply:", {Arg::Unsigned}, {}},
-        {"getDeviceInfoForSerialNumber:usingPolicy:withReply:", {Arg::String, Arg::Unsigned}, {}},
-        {"getAllDeviceInfosUsingPolicy:updateFollowUps:withReply:", {Arg::Unsigned, Arg::Bool}, {}},
-        // The dismissals need the warranty provider, which connection agents do not have yet.
-        {"dismissFollowUpForSerialNumber:completion:", {Arg::String}, {}},
-        {"dismissNotificationForSerialNumber:completion:", {Arg::String}, {}},
+        {"getDefaultDeviceInfoUsingPolicy:withReply:",
+         {Arg::Unsigned},
+         [](QAXAgentProtocol& agent, const Value::Array& args, RemoteReplyHandler reply) {
+             agent.getDefaultDeviceInfoUsingPolicy(policyArg(args, 0),
+                                                   deviceInfoReply(std::move(reply)));
+         }},
+        {"getDeviceInfoForSerialNumber:usingPolicy:withReply:",
+         {Arg::SerialNumber, Arg::Unsigned},
+         [](QAXAgentProtocol& agent, const Value::Array& args, RemoteReplyHandler reply) {
+             agent.getDeviceInfoForSerialNumber(stringArg(args, 0), policyArg(args, 1),
+                                                deviceInfoReply(std::move(reply)));
+         }},
+        {"getAllDeviceInfosUsingPolicy:updateFollowUps:withReply:",
+         {Arg::Unsigned, Arg::Bool},
+         [](QAXAgentProtocol& agent, const Value::Array& args, RemoteReplyHandler reply) {
+             agent.getAllDeviceInfosUsingPolicy(
+                 policyArg(args, 0), *args[1].asBool(),
+                 [reply](std::vector<std::shared_ptr<QAXDeviceInfo>> infos) {
+                     Value::Array archived;
+                     for (const auto& info : infos) {
+                         if (info) {
+                             archived.push_back(info->encode());
+                         }
+                     }
+                     reply(RemoteReply::of(Value(std::move(archived))));
+                 });
+         }},
+        {"dismissFollowUpForSerialNumber:completion:",
+         {Arg::SerialNumber},
+         [](QAXAgentProtocol& agent, const Value::Array& args, RemoteReplyHandler reply) {
+             agent.dismissFollowUpForSerialNumber(stringArg(args, 0), boolReply(std::move(reply)));
+         }},
+        {"dismissNotificationForSerialNumber:completion:",
+         {Arg::SerialNumber},
+         [](QAXAgentProtocol& agent, const Value::Array& args, RemoteReplyHandler reply) {
+             agent.dismissNotificationForSerialNumber(stringArg(args, 0),
+                                                      boolReply(std::move(reply)));
+         }},
     };
     return table;
 }
@@ -138,10 +224,6 @@ void QAXAgentRemoteInterface::invoke(const std::shared_ptr<ExportedObject>& obje
     }
     if (!argsMatch) {
         reply(RemoteReply::failure("wrong arguments: " + expectedArguments(*found)));
-        return;
-    }
-    if (!found->call) {
-        reply(RemoteReply::failure(kUnsupportedOperation));
         return;
     }
     auto* agent = dynamic_cast<QAXAgentProtocol*>(object.get());

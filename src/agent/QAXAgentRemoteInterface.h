@@ -1,7 +1,7 @@
 // QAXAgentProtocol as an IPC interface: maps each operation's full keyword name to a call on
-// the exported agent, checking the kind and count of the arguments and archiving the reply.
-// Operations whose implementation has not joined the agent yet answer "unsupported
-// operation"; names outside the protocol answer "unknown operation". Stateless; called on the
+// the exported agent, checking the kind and count of the arguments (serial numbers must be
+// short, non-empty strings; policies non-negative integers) and archiving the reply. Names
+// outside the protocol answer "unknown operation". Stateless; called on the
 // connection's request queue, replies from wherever the agent finishes; one description may
 // serve every connection.
 #pragma once

@@ -46,6 +46,14 @@ class QAXWarrantyDownloader : public std::enable_shared_from_this<QAXWarrantyDow
         const std::shared_ptr<QAXWarranty>& cachedWarranty);
 
   private:
+    // One attempt, on a blocking thread: sign, set the body, attest, send.
+    void sendAttempt(const std::string& url, const std::string& serialNumber, std::int32_t retries,
+                     std::function<void(std::optional<Value>)> completionBlock);
+    // On the background queue: the record, the conversion rule, the cache and its keys.
+    void handleDownloadedDictionary(const std::string& serialNumber,
+                                    const std::optional<Value>& dictionary,
+                                    const Completion& completion);
+
     const std::shared_ptr<Platform> platform_;
     const std::string callingProcessBundleID_;
 };

@@ -1,32 +1,21 @@
 // The agent's operations as clients reach them: names, argument checks, archived replies.
 #include <gtest/gtest.h>
 
+#include <cmath>
 #include <set>
 
 #include "agent/QAXAgent.h"
 #include "agent/QAXAgentRemoteInterface.h"
+#include "fakes/FakeAgentFactory.h"
 #include "fakes/FakeServices.h"
+#include "fakes/FakeWarrantyProvider.h"
+#include "fakes/FixedDeviceProvider.h"
 #include "fakes/TestPlatform.h"
 
 namespace qax {
 namespace {
 
-class FixedDevices : public QAXAgentDeviceProvider {
-  public:
-    std::shared_ptr<QAXDevice> defaultDevice() override { return phone; }
-    QAXDeviceMap pairedDevices() override { return watches; }
-    QAXDeviceMap allDevices() override {
-        QAXDeviceMap all = watches;
-        all[*phone->serialNumber()] = phone;
-        return all;
-    }
-    std::shared_ptr<QAXDevice> phone =
-        QAXDevice::deviceWithName("Default Device", "PHONE1", Date(10), QAXDeviceTypeDefault);
-    QAXDeviceMap watches = {
-        {"W1", QAXDevice::deviceWithName("One", "W1", Date(20), QAXDeviceTypeWatch)},
-        {"W2", QAXDevice::deviceWithName("Two", "W2", std::nullopt, QAXDeviceTypeWatch)},
-    };
-};
+using FixedDevices = test::FixedDeviceProvider;
 
 class QAXAgentRemoteInterfaceTest : public ::testing::Test {
   protected:
@@ -34,70 +23,133 @@ class QAXAgentRemoteInterfaceTest : public ::testing::Test {
         int calls = 0;
         RemoteReply reply;
     };
+    // Runs the agent's queued work too: joins, the blocking support check.
     Outcome invoke(const std::string& op, Value::Array args,
                    std::shared_ptr<ExportedObject> object = nullptr) {
-        Outcome out;
-        QAXAgentRemoteInterface().invoke(object ? object : agent, op, args, [&out](RemoteReply r) {
-            ++out.calls;
-            out.reply = std::move(r);
+        auto out = std::make_shared<Outcome>();
+        QAXAgentRemoteInterface().invoke(object ? object : agent, op, args, [out](RemoteReply r) {
+            ++out->calls;
+            out->reply = std::move(r);
         });
-        return out;
+        env.runner->runUntilIdle();
+        return *out;
     }
 
     test::TestPlatform env;
     std::shared_ptr<FixedDevices> devices = std::make_shared<FixedDevices>();
+    std::shared_ptr<test::FakeWarrantyProvider> provider =
+        std::make_shared<test::FakeWarrantyProvider>();
     std::shared_ptr<QAXAgent> agent =
-        QAXAgent::initWithWarrantyProvider(env.platform, nullptr, devices);
+        QAXAgent::initWithWarrantyProvider(env.platform, provider, devices);
 };
 
-TEST_F(QAXAgentRemoteInterfaceTest, NamesArgumentsAndUnbuiltOperations) {
+// The class name of an archived record, or the reply's own kind.
+std::string shapeOf(const RemoteReply& reply) {
+    if (reply.error) {
+        return "error";
+    }
+    if (!reply.value) {
+        return "none";
+    }
+    const Value& v = *reply.value;
+    if (const Value* cls = v.find("$class")) {
+        return *cls->asString();
+    }
+    if (v.isArray()) {
+        std::string shape = "[";
+        for (const auto& e : *v.asArray()) {
+            const Value* cls = e.find("$class");
+            shape += (cls ? *cls->asString() : std::string("?")) + ",";
+        }
+        return shape + "]";
+    }
+    return v.description();
+}
+
+TEST_F(QAXAgentRemoteInterfaceTest, EveryOperationWithGoodAndHostileArguments) {
+    const std::string huge(5000, 'S');
+    const std::string nul("A\0B", 3);
+    const std::string maxLength(256, '/');
+    const std::string wrong = "error";
+    const std::string yes = Value(true).description();
+    const std::string no = Value(false).description();
     struct Case {
         const char* op;
         Value::Array args;
-        const char* error;  // nullptr: a reply
-    };
-    const char* wrong = "wrong arguments";
-    const char* unsupported = "unsupported operation";
-    const Case cases[] = {
-        {"defaultDevice:", {}, nullptr},
-        {"defaultDevice:", {Value(1)}, wrong},
-        {"pairedDevices:", {}, nullptr},
-        {"readWebURLOverride:", {}, nullptr},
-        {"noSuchOperation:", {}, "unknown operation 'noSuchOperation:'"},
-        {"defaultDevice", {}, "unknown operation 'defaultDevice'"},
-        {"scheduleOutreachWithReply:", {}, unsupported},
-        {"scheduleOutreachAfter:withReply:", {Value(3.5)}, unsupported},
-        {"scheduleOutreachAfter:withReply:", {Value(3)}, unsupported},
+        std::string shape;  // "error", "none", a class name, "[...]" or a printed value
+    } cases[] = {
+        {"scheduleOutreachWithReply:", {}, yes},
+        {"scheduleOutreachAfter:withReply:", {Value(3.5)}, yes},
+        {"scheduleOutreachAfter:withReply:", {Value(-30)}, yes},
         {"scheduleOutreachAfter:withReply:", {Value("3")}, wrong},
-        {"velmoraAccountAddedWithReply:", {}, unsupported},
-        {"checkIsAvailableInStore:withReply:", {Value("com.velmora.support")}, unsupported},
+        {"scheduleOutreachAfter:withReply:", {Value(std::nan(""))}, wrong},
+        {"scheduleOutreachAfter:withReply:", {Value(HUGE_VAL)}, wrong},
+        {"velmoraAccountAddedWithReply:", {}, no},
+        {"velmoraAccountAddedWithReply:", {Value(true)}, wrong},
+        {"checkIsAvailableInStore:withReply:", {Value("com.velmora.support")}, "none"},
         {"checkIsAvailableInStore:withReply:", {}, wrong},
-        {"appSupportAvailability:withReply:", {Value("x")}, unsupported},
-        {"getDefaultDeviceInfoUsingPolicy:withReply:", {Value(0)}, unsupported},
+        {"checkIsAvailableInStore:withReply:", {Value(huge)}, wrong},
+        {"appSupportAvailability:withReply:",
+         {Value("com.velmora.support")},
+         Value(Value::Dictionary{{"AppBundleID", "com.velmora.support"}}).description()},
+        {"appSupportAvailability:withReply:", {Value(Value::Array{})}, wrong},
+        {"readWebURLOverride:", {}, "none"},
+        {"defaultDevice:", {}, "QAXDevice"},
+        {"defaultDevice:", {Value(1)}, wrong},
+        {"pairedDevices:", {}, "[QAXDevice,QAXDevice,]"},
+        {"getDefaultDeviceInfoUsingPolicy:withReply:", {Value(0)}, "QAXDeviceInfo"},
+        {"getDefaultDeviceInfoUsingPolicy:withReply:", {Value(5)}, "QAXDeviceInfo"},
         {"getDefaultDeviceInfoUsingPolicy:withReply:", {Value(-1)}, wrong},
+        {"getDefaultDeviceInfoUsingPolicy:withReply:", {Value(1.0)}, wrong},
+        {"getDefaultDeviceInfoUsingPolicy:withReply:", {Value("0")}, wrong},
         {"getDeviceInfoForSerialNumber:usingPolicy:withReply:",
          {Value("S"), Value(2)},
-         unsupported},
+         "QAXDeviceInfo"},
+        {"getDeviceInfoForSerialNumber:usingPolicy:withReply:",
+         {Value(maxLength), Value(1)},
+         "QAXDeviceInfo"},
+        {"getDeviceInfoForSerialNumber:usingPolicy:withReply:", {Value(""), Value(0)}, wrong},
+        {"getDeviceInfoForSerialNumber:usingPolicy:withReply:", {Value(huge), Value(0)}, wrong},
+        {"getDeviceInfoForSerialNumber:usingPolicy:withReply:", {Value(nul), Value(0)}, wrong},
+        {"getDeviceInfoForSerialNumber:usingPolicy:withReply:", {Value(42), Value(0)}, wrong},
         {"getDeviceInfoForSerialNumber:usingPolicy:withReply:", {Value(2), Value("S")}, wrong},
         {"getAllDeviceInfosUsingPolicy:updateFollowUps:withReply:",
-         {Value(0), Value(true)},
-         unsupported},
+         {Value(1), Value(true)},
+         "[QAXDeviceInfo,QAXDeviceInfo,QAXDeviceInfo,]"},
         {"getAllDeviceInfosUsingPolicy:updateFollowUps:withReply:", {Value(0), Value(1)}, wrong},
         {"getAllDeviceInfosUsingPolicy:updateFollowUps:withReply:", {Value(0)}, wrong},
-        {"dismissFollowUpForSerialNumber:completion:", {Value("S")}, unsupported},
+        {"dismissFollowUpForSerialNumber:completion:", {Value("S")}, yes},
+        {"dismissFollowUpForSerialNumber:completion:", {Value("")}, wrong},
+        {"dismissNotificationForSerialNumber:completion:", {Value("S")}, yes},
         {"dismissNotificationForSerialNumber:completion:", {Value(true)}, wrong},
+        {"dismissNotificationForSerialNumber:completion:", {Value(huge)}, wrong},
+        {"noSuchOperation:", {}, wrong},
+        {"defaultDevice", {}, wrong},
     };
     for (const auto& c : cases) {
+        SCOPED_TRACE(std::string(c.op) + " " + Value(c.args).description().substr(0, 80));
         auto out = invoke(c.op, c.args);
-        EXPECT_EQ(out.calls, 1) << c.op;
-        if (c.error) {
-            ASSERT_TRUE(out.reply.error.has_value()) << c.op;
-            EXPECT_EQ(out.reply.error->rfind(c.error, 0), 0u) << c.op << ": " << *out.reply.error;
-            EXPECT_FALSE(out.reply.value) << c.op;
-        } else {
-            EXPECT_FALSE(out.reply.error) << c.op << ": " << out.reply.error.value_or("");
-        }
+        EXPECT_EQ(out.calls, 1);
+        EXPECT_EQ(shapeOf(out.reply), c.shape) << out.reply.error.value_or("");
     }
+    // What reached the agent's collaborators, in order.
+    EXPECT_EQ(provider->calls(),
+              (std::vector<std::string>{"download PHONE1", "refreshOne PHONE1", "refreshOne PHONE1",
+                                        "download S", "refreshOne S", "refreshOne " + maxLength,
+                                        "refresh 3", "dismiss S", "dismissNotification S"}));
+    auto schedulings =
+        static_cast<test::FakeAgentFactory&>(*env.platform->agentFactory).schedulings();
+    ASSERT_EQ(schedulings.size(), 3u);
+    EXPECT_EQ(schedulings[1].date, env.clock->now().byAdding(3.5));
+    EXPECT_EQ(schedulings[2].date, env.clock->now().byAdding(-30));
+}
+
+TEST_F(QAXAgentRemoteInterfaceTest, ErrorsNameTheExpectedArguments) {
+    auto out = invoke("getDeviceInfoForSerialNumber:usingPolicy:withReply:", {Value("")});
+    EXPECT_EQ(out.reply.error,
+              "wrong arguments: 'getDeviceInfoForSerialNumber:usingPolicy:withReply:' takes 2 "
+              "arguments (serial number of 1 to 256 characters, unsigned integer)");
+    EXPECT_EQ(invoke("noSuchOperation:", {}).reply.error, "unknown operation 'noSuchOperation:'");
 }
 
 TEST_F(QAXAgentRemoteInterfaceTest, DeviceRepliesAreArchives) {
@@ -144,7 +196,7 @@ TEST_F(QAXAgentRemoteInterfaceTest, ObjectThatIsNotAnAgentGetsAnError) {
     EXPECT_TRUE(out.reply.error);
 }
 
-TEST(QAXAgentTest, CallingProcessFallsBackToTheSettingsApplication) {
+TEST(QAXAgentCreationTest, CallingProcessFallsBackToTheSettingsApplication) {
     test::TestPlatform env;
     EXPECT_EQ(QAXAgent::initWithCallingProcessBundleID(env.platform, "com.example.client")
                   ->callingProcessBundleID(),

@@ -6,6 +6,7 @@
 #include <random>
 #include <sstream>
 
+#include "fakes/FakeAgentFactory.h"
 #include "fakes/FakeAnalyticsSink.h"
 #include "fakes/FakeBackgroundActivities.h"
 #include "fakes/FakeFollowUpCenter.h"
@@ -61,6 +62,7 @@ TestPlatform::TestPlatform() {
     platform->deviceProperties = std::make_shared<FakeDeviceProperties>();
     platform->locale = std::make_shared<FakeLocaleInfo>();
     platform->lifecycle = std::make_shared<FakeProcessLifecycle>();
+    platform->agentFactory = std::make_shared<FakeAgentFactory>();
     platform->activities = std::make_shared<FakeBackgroundActivityScheduler>();
     platform->followUps = std::make_shared<InMemoryFollowUpCenter>();
     platform->analytics = std::make_shared<RecordingAnalyticsSink>();

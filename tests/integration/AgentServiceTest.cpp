@@ -77,6 +77,26 @@ TEST_F(AgentServiceTest, EntitledClientGetsTheDefaultDevice) {
                                  " with calling process: (null)"));
 }
 
+TEST_F(AgentServiceTest, DeviceInfosAndDismissalsAreServed) {
+    auto client = connect();
+    std::string error;
+    // Cached only: nothing is cached, so the one device comes back without a warranty.
+    auto all = client->call("getAllDeviceInfosUsingPolicy:updateFollowUps:withReply:",
+                            {Value(1), Value(true)}, kWait, &error);
+    ASSERT_TRUE(all && all->value && all->value->isArray()) << error;
+    ASSERT_EQ(all->value->size(), 1u);
+    const Value& info = (*all->value->asArray())[0];
+    EXPECT_EQ(*info.find("$class"), Value("QAXDeviceInfo"));
+    EXPECT_EQ(*info.find("device")->find("serialNumber"), Value("ITEST-SN-1"));
+    EXPECT_FALSE(info.find("warranty"));
+
+    auto dismissed = client->call(
+        "dismissFollowUpForSerialNumber:completion:", {Value("ITEST-SN-1")}, kWait, &error);
+    ASSERT_TRUE(dismissed) << error;
+    EXPECT_EQ(dismissed->value, Value(true));
+    EXPECT_TRUE(agent.running());
+}
+
 TEST_F(AgentServiceTest, ClientsWithoutTheEntitlementAreClosed) {
     const std::pair<const char*, std::optional<Value>> refused[] = {
         {"no entitlement", std::nullopt},
@@ -163,9 +183,9 @@ TEST_F(AgentServiceTest, ErrorRepliesLeaveTheConnectionOpen) {
     const std::tuple<const char*, Value::Array, const char*> cases[] = {
         {"noSuchOperation:", {}, "unknown operation 'noSuchOperation:'"},
         {"defaultDevice:", {Value(1)}, "wrong arguments"},
-        {"getAllDeviceInfosUsingPolicy:updateFollowUps:withReply:",
-         {Value(0), Value(true)},
-         "unsupported operation"},
+        {"getDeviceInfoForSerialNumber:usingPolicy:withReply:",
+         {Value(""), Value(0)},
+         "wrong arguments"},
     };
     for (const auto& [op, args, error] : cases) {
         std::string transport;
