@@ -78,7 +78,7 @@ std::shared_ptr<Platform> makeHostPlatform(const HostEnvironment& environment,
     p->preferences = std::make_shared<FilePreferenceStore>(
         FilePreferenceStore::domainPath(environment.homeDirectory));
     p->deviceProperties = std::make_shared<HostDeviceProperties>(environment.platformRoot);
-    p->locale = std::make_shared<HostLocaleInfo>();
+    p->locale = std::make_shared<HostLocaleInfo>(p->platformRoot);
 
     p->http =
         std::make_shared<CurlHttpClient>(CurlHttpClient::optionsForPlatformRoot(p->platformRoot));
