@@ -10,6 +10,8 @@
 #include <chrono>
 #include <cmath>
 #include <filesystem>
+#include <future>
+#include <map>
 #include <regex>
 #include <thread>
 
@@ -17,6 +19,7 @@
 #include "CoverageSimProcess.h"
 #include "core/JsonCodec.h"
 #include "core/PlistCodec.h"
+#include "platform/host/CurlHttpClient.h"
 #include "platform/host/FilePreferenceStore.h"
 #include "platform/host/SystemClock.h"
 
@@ -56,6 +59,9 @@ class OfferRoadTest : public ::testing::Test {
                  Value(Value::Dictionary{{"altDSID", "road-kf"},
                                          {"TokenServiceURL", sim->base() + "/token"}})},
                 {"StoreAccount", Value(Value::Dictionary{{"storefront", "143441-1,29"}})}}));
+        // qaxctl asks for an outreach as the settings application would.
+        agent.registerApplication("settings", QAX_CTL_BINARY, "com.velmora.Preferences",
+                                  Value(true));
         agent.extraEnvironment = {"QAX_CLOCK=simulated", "QAX_NETWORK=up",
                                   "QAX_BOOT_ID=road-boot-1"};
         for (const auto& [key, path] :
@@ -159,6 +165,32 @@ class OfferRoadTest : public ::testing::Test {
         return out;
     }
 
+    // Sets coverage-sim's scenario (a JSON object), or clears it without one.
+    int scenario(std::optional<std::string> body) {
+        CurlHttpClient::Options options;
+        options.extraCAFile = sim->caFile();
+        CurlHttpClient http(options);
+        HttpRequest request(sim->base() + "/admin/scenario", 20);
+        request.setMethod(body ? "POST" : "DELETE");
+        request.setBody(std::move(body));
+        std::promise<HttpResult> done;
+        http.send(request, [&](HttpResult r) { done.set_value(std::move(r)); });
+        auto result = done.get_future().get();
+        return result.response ? static_cast<int>(result.response->statusCode) : 0;
+    }
+    // Every cache file of the agent and its bytes.
+    std::map<std::string, std::string> cacheFiles() {
+        std::map<std::string, std::string> files;
+        std::error_code ec;
+        for (const auto& entry : std::filesystem::directory_iterator(
+                 std::filesystem::path(agent.home()) /
+                     "Library/Application Support/com.velmora.Kestova",
+                 ec)) {
+            files[entry.path().filename().string()] = test::readFile(entry.path());
+        }
+        return files;
+    }
+
     double start = 0;
     test::TempDir state;
     test::TempDir fixtures;
@@ -201,6 +233,21 @@ TEST_F(OfferRoadTest, FortyDaysOfAnOffer) {
     ASSERT_TRUE(waitForEnds("followuprefresh", 1)) << agent.log();
     EXPECT_EQ(rows(), std::vector<std::string>{"Add the Haverly plan|29|-|-"});
     EXPECT_TRUE(registered("followuprefresh"));
+
+    // The coverage service goes down during an outreach: the run ends without scheduling and
+    // the cache and the item stay as they were.
+    const auto cacheBefore = cacheFiles();
+    ASSERT_FALSE(cacheBefore.empty());
+    ASSERT_EQ(scenario(R"({"ROADPHONE01": ["reset", "reset", "reset", "reset"]})"), 200);
+    const int outreachRuns = ends("outreach");
+    ASSERT_EQ(ctl({"schedule-outreach"}).status, 0);
+    ASSERT_TRUE(waitForEnds("outreach", outreachRuns + 1)) << agent.log();
+    EXPECT_TRUE(agent.countInLog("Warranty failed to download"));
+    EXPECT_TRUE(agent.countInLog("Conversion: 0 -- No devices eligible for followUp posts"));
+    ASSERT_EQ(scenario(std::nullopt), 200);
+    EXPECT_EQ(cacheFiles(), cacheBefore);
+    EXPECT_FALSE(target("followuppost"));
+    EXPECT_EQ(rows(), std::vector<std::string>{"Add the Haverly plan|29|-|-"});
 
     // A watch with its own offer (day 15 to 38) is paired: the post is due again on day 15.
     agent.writeRootFile("paired-devices.plist",
