@@ -203,7 +203,12 @@ void QAXWarrantyDownloader::handleDownloadedDictionary(const std::string& serial
 
     const std::string locale = platform_->locale->preferredLocaleIdentifier();
     qaxLog().info("caching warranty for locale: '%@', version: %@", locale, kCacheVersion);
-    warranty->cacheWarranty(serialNumber);
+    if (!warranty->cacheWarranty(serialNumber)) {
+        // The keys describe the file on disk: stamping them over the previous file would make
+        // that older summary look freshly downloaded for this locale.
+        completion(true, std::move(warranty));
+        return;
+    }
 
     PreferenceStore& preferences = *platform_->preferences;
     const std::string hash = sha256Hash(serialNumber);
