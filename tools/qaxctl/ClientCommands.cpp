@@ -29,8 +29,8 @@ constexpr int kExitFailure = 70;
 
 std::string agentSocketPath() {
     const auto env = qax::HostEnvironment::fromProcessEnvironment();
-    return qax::HostServiceListenerFactory::socketPath(env.runtimeDirectory,
-                                                       qax::kQAXAgentServiceName);
+    return qax::HostServiceListenerFactory::clientSocketPath(env.runtimeDirectory,
+                                                             qax::kQAXAgentServiceName);
 }
 
 // Calls `op` and hands its reply to `onReply`; returns the exit status.

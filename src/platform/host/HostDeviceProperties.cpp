@@ -34,7 +34,6 @@ constexpr std::array kPlaceholders = {
     "to be filled by o.e.m.",
     "default string",
     "system serial number",
-    "not specified",
     "not applicable",
     "none",
     "n/a",
