@@ -101,14 +101,13 @@ std::optional<Value> HostDeviceProperties::copyDeviceProperty(std::string_view n
             return std::nullopt;
         }
     }
-    const MachineFacts& facts = machine();
     const std::optional<std::string>* fact = nullptr;
     if (name == kSerialNumberKey) {
-        fact = &facts.serialNumber;
+        fact = &machineSerialNumber();
     } else if (name == kProductTypeKey) {
-        fact = &facts.productType;
+        fact = &machine().productType;
     } else if (name == kProductVersionKey) {
-        fact = &facts.systemVersion;
+        fact = &machine().systemVersion;
     }
     if (fact && *fact) {
         return Value(**fact);
@@ -127,9 +126,13 @@ const HostDeviceProperties::MachineFacts& HostDeviceProperties::machine() {
     return machine_;
 }
 
+const std::optional<std::string>& HostDeviceProperties::machineSerialNumber() {
+    std::call_once(serialOnce_, [this] { serialNumber_ = readSerialNumber(); });
+    return serialNumber_;
+}
+
 HostDeviceProperties::MachineFacts HostDeviceProperties::readMachineFacts() const {
     MachineFacts facts;
-    facts.serialNumber = readSerialNumber();
 
     std::string error;
     auto name =

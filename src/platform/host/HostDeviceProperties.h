@@ -26,7 +26,6 @@ class HostDeviceProperties : public DeviceProperties {
 
   private:
     struct MachineFacts {
-        std::optional<std::string> serialNumber;
         std::optional<std::string> productType;
         std::optional<std::string> systemVersion;
     };
@@ -34,6 +33,8 @@ class HostDeviceProperties : public DeviceProperties {
     bool deviceFileExists() const;
     const MachineFacts& machine();
     MachineFacts readMachineFacts() const;
+    // Read only when asked for: a machine without one logs it once.
+    const std::optional<std::string>& machineSerialNumber();
     std::optional<std::string> readSerialNumber() const;
 
     CachedPlistFile file_;
@@ -41,6 +42,8 @@ class HostDeviceProperties : public DeviceProperties {
     const std::string dmiDirectory_;
     std::once_flag machineOnce_;
     MachineFacts machine_;
+    std::once_flag serialOnce_;
+    std::optional<std::string> serialNumber_;
 };
 
 }  // namespace qax
