@@ -3,6 +3,7 @@
 // lost in between (preferences kept, a client that arrives while it exits is served by the next
 // instance).
 #include <gtest/gtest.h>
+#include <poll.h>
 #include <sys/socket.h>
 #include <sys/stat.h>
 #include <sys/un.h>
@@ -27,6 +28,29 @@ constexpr double kWait = 10;
 constexpr const char* kIdleExit = "QAX_IDLE_EXIT_SECONDS=1";
 constexpr const char* kExitedIdle = "Exiting after 1 seconds without a client";
 constexpr const char* kStartedOnDemand = "Started on demand";
+
+// A Unix socket of `type` bound at `path`; -1 on failure.
+int bindUnixSocket(int type, const std::string& path) {
+    const int fd = ::socket(AF_UNIX, type | SOCK_CLOEXEC, 0);
+    sockaddr_un address{};
+    address.sun_family = AF_UNIX;
+    std::snprintf(address.sun_path, sizeof address.sun_path, "%s", path.c_str());
+    if (fd < 0 || ::bind(fd, reinterpret_cast<sockaddr*>(&address), sizeof address) != 0) {
+        return -1;
+    }
+    return fd;
+}
+
+// The next datagram on `fd`, or an empty text after 10 seconds.
+std::string receiveNotice(int fd) {
+    pollfd p{fd, POLLIN, 0};
+    if (::poll(&p, 1, 10'000) != 1) {
+        return "";
+    }
+    char buffer[512];
+    const ssize_t n = ::recv(fd, buffer, sizeof buffer, 0);
+    return n > 0 ? std::string(buffer, static_cast<std::size_t>(n)) : "";
+}
 
 class OnDemandStartTest : public ::testing::Test {
   protected:
@@ -114,19 +138,20 @@ TEST_F(OnDemandStartTest, FirstConnectionStartsItIdleEndsItTheNextStartsItAgainW
 }
 
 // The service manager keeps its listening socket across instances; this test holds one the
-// same way and hands it to each instance it starts.
+// same way, hands it to each instance it starts and reads their readiness notices.
 TEST_F(OnDemandStartTest, AClientArrivingWhileTheAgentExitsIsServedByTheNextInstance) {
-    const int listening = ::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
+    const int listening = bindUnixSocket(SOCK_STREAM, agent.socketPath());
     ASSERT_GE(listening, 0);
-    sockaddr_un address{};
-    address.sun_family = AF_UNIX;
-    std::snprintf(address.sun_path, sizeof address.sun_path, "%s", agent.socketPath().c_str());
-    ASSERT_EQ(::bind(listening, reinterpret_cast<sockaddr*>(&address), sizeof address), 0);
     ASSERT_EQ(::listen(listening, 16), 0);
+    // Where the agent reports readiness, as to the service manager.
+    const std::string notifyPath = agent.home() + "/manager-notify";
+    const int notices = bindUnixSocket(SOCK_DGRAM, notifyPath);
+    ASSERT_GE(notices, 0);
     // The agent reads the socket from descriptor 3, named for its own process id.
     auto start = [&] {
         auto environment = agent.environment();
         environment.push_back(kIdleExit);
+        environment.push_back("NOTIFY_SOCKET=" + notifyPath);
         // The descriptor is close-on-exec in this process: the shell gets a copy made for it.
         const int inherited = ::dup(listening);
         EXPECT_GE(inherited, 0);
@@ -145,6 +170,7 @@ TEST_F(OnDemandStartTest, AClientArrivingWhileTheAgentExitsIsServedByTheNextInst
         HostIpcClient client;
         EXPECT_EQ(defaultSerial(client), "OD-SN-1");
     }
+    EXPECT_EQ(receiveNotice(notices), "READY=1\nSTATUS=Serving clients");
     // Connects the moment the first instance decides to go.
     ASSERT_TRUE(agent.waitForLog(kExitedIdle, 1, kWait)) << agent.log();
     HostIpcClient late;
@@ -152,6 +178,7 @@ TEST_F(OnDemandStartTest, AClientArrivingWhileTheAgentExitsIsServedByTheNextInst
     ASSERT_TRUE(late.connect(agent.socketPath(), &error)) << error;
     ASSERT_TRUE(late.sendRequest(7, "defaultDevice:", {}, &error)) << error;
     EXPECT_TRUE(exitedCleanly(first->waitForExit(kWait))) << agent.log();
+    EXPECT_EQ(receiveNotice(notices), "STOPPING=1");
     struct stat st {};
     EXPECT_TRUE(::stat(agent.socketPath().c_str(), &st) == 0 && S_ISSOCK(st.st_mode))
         << "the socket path belongs to the service manager and stays";
@@ -168,6 +195,7 @@ TEST_F(OnDemandStartTest, AClientArrivingWhileTheAgentExitsIsServedByTheNextInst
     late.close();
     EXPECT_TRUE(exitedCleanly(second->waitForExit(kWait))) << agent.log();
     ::close(listening);
+    ::close(notices);
 }
 
 }  // namespace

@@ -4,6 +4,7 @@
 #include <systemd/sd-daemon.h>
 #include <unistd.h>
 
+#include <cstdlib>
 #include <cstring>
 
 #include "core/Log.h"
@@ -11,6 +12,10 @@
 namespace qax {
 
 std::optional<int> HostSocketActivation::takeListeningSocket() {
+    if (!std::getenv("LISTEN_FDS")) {
+        // Started by hand: leave the environment alone (clearing it races other threads).
+        return std::nullopt;
+    }
     const int count = sd_listen_fds(1);
     if (count < 0) {
         qaxLog().error("Cannot read the sockets passed to the agent: %s", std::strerror(-count));
