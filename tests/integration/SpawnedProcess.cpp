@@ -13,20 +13,17 @@
 
 namespace qax::test {
 
-SpawnedProcess::SpawnedProcess(const std::string& program, const std::vector<std::string>& args,
-                               const std::vector<std::string>& environment,
-                               const std::string& logPath) {
-    std::vector<std::string> argStrings{program};
-    argStrings.insert(argStrings.end(), args.begin(), args.end());
-    std::vector<std::string> envStrings = environment;
+SpawnedProcess::SpawnedProcess(const std::string& program, std::vector<std::string> args,
+                               std::vector<std::string> environment, const std::string& logPath) {
+    args.insert(args.begin(), program);
     std::vector<char*> argv, envp;
-    for (auto& s : argStrings) {
+    for (auto& s : args) {
         argv.push_back(s.data());
     }
-    argv.push_back(nullptr);
-    for (auto& s : envStrings) {
+    for (auto& s : environment) {
         envp.push_back(s.data());
     }
+    argv.push_back(nullptr);
     envp.push_back(nullptr);
     posix_spawn_file_actions_t actions;
     posix_spawn_file_actions_init(&actions);
@@ -47,52 +44,35 @@ SpawnedProcess::~SpawnedProcess() {
     }
 }
 
-bool SpawnedProcess::running() {
-    return pid_ > 0 && !waitForExit(0);
-}
-
 std::optional<int> SpawnedProcess::waitForExit(double seconds) {
-    if (status_ || pid_ <= 0) {
-        return status_;
-    }
     const auto deadline = std::chrono::steady_clock::now() +
-                          std::chrono::duration_cast<std::chrono::steady_clock::duration>(
-                              std::chrono::duration<double>(seconds));
-    for (;;) {
+                          std::chrono::milliseconds(static_cast<long>(seconds * 1000));
+    while (!status_ && pid_ > 0) {
         int status = 0;
         const pid_t r = ::waitpid(pid_, &status, WNOHANG);
-        if (r == pid_ || r < 0) {
+        if (r != 0) {
             status_ = r == pid_ ? status : -1;
-            return status_;
+        } else if (std::chrono::steady_clock::now() >= deadline) {
+            break;
+        } else {
+            std::this_thread::sleep_for(std::chrono::milliseconds(5));
         }
-        if (std::chrono::steady_clock::now() >= deadline) {
-            return std::nullopt;
-        }
-        std::this_thread::sleep_for(std::chrono::milliseconds(5));
     }
+    return status_;
 }
 
-std::optional<int> SpawnedProcess::stop() {
-    if (!running()) {
-        return status_;
+void SpawnedProcess::terminate() {
+    if (running()) {
+        ::kill(pid_, SIGTERM);
     }
-    ::kill(pid_, SIGTERM);
-    if (auto status = waitForExit(10)) {
-        return status;
-    }
-    ::kill(pid_, SIGKILL);
-    waitForExit(10);
-    return std::nullopt;
 }
 
 std::optional<std::string> findProgram(const std::string& name) {
     const char* path = std::getenv("PATH");
-    std::istringstream dirs(std::string(path ? path : "") + ":/usr/bin:/bin:/usr/sbin:/sbin");
-    std::string dir;
-    while (std::getline(dirs, dir, ':')) {
-        const std::string candidate = (dir.empty() ? "." : dir) + "/" + name;
-        if (::access(candidate.c_str(), X_OK) == 0) {
-            return candidate;
+    std::istringstream dirs(path ? path : "/usr/bin:/bin");
+    for (std::string dir; std::getline(dirs, dir, ':');) {
+        if (!dir.empty() && ::access((dir + "/" + name).c_str(), X_OK) == 0) {
+            return dir + "/" + name;
         }
     }
     return std::nullopt;

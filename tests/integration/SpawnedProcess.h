@@ -1,6 +1,6 @@
-// A program the test starts with an environment of its own and its standard error in a file,
-// for wrappers (the socket activator) and installed copies of the programs that AgentProcess
-// does not start. Killed (SIGKILL) if still running when the object goes.
+// A program started in the background with its own environment and its output appended to a
+// file (the socket activator, installed copies of the programs); killed if it still runs when
+// the object goes.
 #pragma once
 
 #include <sys/types.h>
@@ -13,25 +13,21 @@ namespace qax::test {
 
 class SpawnedProcess {
   public:
-    SpawnedProcess(const std::string& program, const std::vector<std::string>& args,
-                   const std::vector<std::string>& environment, const std::string& logPath);
+    SpawnedProcess(const std::string& program, std::vector<std::string> args,
+                   std::vector<std::string> environment, const std::string& logPath);
     ~SpawnedProcess();
-    SpawnedProcess(const SpawnedProcess&) = delete;
-    SpawnedProcess& operator=(const SpawnedProcess&) = delete;
 
-    bool started() const { return pid_ > 0; }
-    bool running();
-    // The raw wait status once it has exited, none if it still runs after `seconds`.
+    bool running() { return pid_ > 0 && !waitForExit(0); }
+    // The raw wait status, none if it still runs after `seconds`.
     std::optional<int> waitForExit(double seconds);
-    // Sends SIGTERM and waits; the wait status, or none if it had to be killed.
-    std::optional<int> stop();
+    void terminate();
 
   private:
     pid_t pid_ = -1;
     std::optional<int> status_;
 };
 
-// The program's path if it is found on PATH (or the usual system directories).
+// The program's path on PATH, if it is there.
 std::optional<std::string> findProgram(const std::string& name);
 
 }  // namespace qax::test
