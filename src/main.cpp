@@ -1,6 +1,7 @@
 // Process entry of qaxagent: builds the host platform from the environment, runs the
-// start-up sequence and then the main event loop until SIGTERM or SIGINT. The main thread
-// runs start-up, then the loop (socket I/O of the IPC service, signals, main-queue work).
+// start-up sequence and then the main event loop until SIGTERM or SIGINT, or, when the service
+// manager started it on demand, until it has been idle (see HostProcessLifecycle). The main
+// thread runs start-up, then the loop (socket I/O of the IPC service, signals, main-queue work).
 #include <csignal>
 
 #include <asio/io_context.hpp>
@@ -24,6 +25,7 @@
 #include "platform/QAXSettings.h"
 #include "platform/ServiceListener.h"
 #include "platform/host/HostPlatform.h"
+#include "platform/host/HostSocketActivation.h"
 #include "scheduling/QAXScheduler.h"
 
 namespace {
@@ -109,9 +111,11 @@ int main() {
         // Another agent serves the name, or the runtime directory is unusable.
         return 1;
     }
+    HostSocketActivation::notifyReady();
 
     // and run the main event loop for the life of the process.
     dispatcher->runMainLoop();
+    HostSocketActivation::notifyStopping();
 
     // Close every client, let the aborted socket operations finish so that connections and
     // their agents go, then stop the queues. The notification socket is released last so that

@@ -1,6 +1,8 @@
 #include "core/Log.h"
 
+#include <sys/stat.h>
 #include <sys/time.h>
+#include <unistd.h>
 
 #include <cctype>
 #include <cinttypes>
@@ -179,23 +181,64 @@ StderrLogSink::StderrLogSink() {
     debug_ = level && std::string_view(level) == "debug";
     const char* priv = std::getenv("QAX_LOG_PRIVATE");
     private_ = priv && std::string_view(priv) == "1";
+    journal_ = isJournalStream(std::getenv("JOURNAL_STREAM"), STDERR_FILENO);
+}
+
+bool StderrLogSink::isJournalStream(const char* journalStream, int fd) {
+    if (!journalStream) {
+        return false;
+    }
+    unsigned long long device = 0, inode = 0;
+    char rest = 0;
+    if (std::sscanf(journalStream, "%llu:%llu%c", &device, &inode, &rest) != 2) {
+        return false;
+    }
+    // A child whose stderr was redirected still inherits the variable: only the named stream
+    // itself is the journal.
+    struct stat st {};
+    return ::fstat(fd, &st) == 0 && static_cast<unsigned long long>(st.st_dev) == device &&
+           static_cast<unsigned long long>(st.st_ino) == inode;
+}
+
+std::string StderrLogSink::formatLine(LogLevel level, std::string_view subsystem,
+                                      std::string_view category, std::string_view message,
+                                      std::string_view time, bool journal) {
+    std::string line;
+    line.reserve(message.size() + 80);
+    if (journal) {
+        switch (level) {
+            case LogLevel::Error:
+                line.append("<3>");
+                break;
+            case LogLevel::Default:
+                line.append("<6>");
+                break;
+            case LogLevel::Debug:
+                line.append("<7>");
+                break;
+        }
+    } else {
+        line.append(time).append(" ");
+    }
+    line.append(logLevelName(level)).append(" ");
+    line.append(subsystem).append(":").append(category).append(" ").append(message);
+    line += '\n';
+    return line;
 }
 
 void StderrLogSink::write(LogLevel level, std::string_view subsystem, std::string_view category,
                           std::string_view message) {
-    timeval tv{};
-    gettimeofday(&tv, nullptr);
-    std::tm tm{};
-    localtime_r(&tv.tv_sec, &tm);
-    char stamp[64];
-    std::snprintf(stamp, sizeof stamp, "%04d-%02d-%02d %02d:%02d:%02d.%03ld", tm.tm_year + 1900,
-                  tm.tm_mon + 1, tm.tm_mday, tm.tm_hour, tm.tm_min, tm.tm_sec,
-                  static_cast<long>(tv.tv_usec / 1000));
-    std::string line;
-    line.reserve(message.size() + 80);
-    line.append(stamp).append(" ").append(logLevelName(level)).append(" ");
-    line.append(subsystem).append(":").append(category).append(" ").append(message);
-    line += '\n';
+    char stamp[64] = "";
+    if (!journal_) {
+        timeval tv{};
+        gettimeofday(&tv, nullptr);
+        std::tm tm{};
+        localtime_r(&tv.tv_sec, &tm);
+        std::snprintf(stamp, sizeof stamp, "%04d-%02d-%02d %02d:%02d:%02d.%03ld", tm.tm_year + 1900,
+                      tm.tm_mon + 1, tm.tm_mday, tm.tm_hour, tm.tm_min, tm.tm_sec,
+                      static_cast<long>(tv.tv_usec / 1000));
+    }
+    const std::string line = formatLine(level, subsystem, category, message, stamp, journal_);
     std::lock_guard lock(mutex_);
     std::fwrite(line.data(), 1, line.size(), stderr);
     std::fflush(stderr);

@@ -135,18 +135,30 @@ Log& qaxLog();
 
 // One line per message on stderr: time, level, subsystem:category, message. Reads
 // QAX_LOG_LEVEL ("debug" shows debug lines) and QAX_LOG_PRIVATE ("1" shows private values).
+// When stderr is the journal's stream (JOURNAL_STREAM names it), a line starts with the
+// journal priority of its level ("<3>" error, "<6>" default, "<7>" debug) instead of the
+// time, which the journal records itself.
 class StderrLogSink : public LogSink {
   public:
     StderrLogSink();
-    StderrLogSink(bool debug, bool showPrivate) : debug_(debug), private_(showPrivate) {}
+    StderrLogSink(bool debug, bool showPrivate, bool journal = false)
+        : debug_(debug), private_(showPrivate), journal_(journal) {}
     void write(LogLevel level, std::string_view subsystem, std::string_view category,
                std::string_view message) override;
     bool isEnabled(LogLevel level) const override { return level != LogLevel::Debug || debug_; }
     bool showsPrivate() const override { return private_; }
 
+    // The line written for one message, newline included; `time` is "YYYY-MM-DD hh:mm:ss.mmm".
+    static std::string formatLine(LogLevel level, std::string_view subsystem,
+                                  std::string_view category, std::string_view message,
+                                  std::string_view time, bool journal);
+    // Whether `fd` is the stream JOURNAL_STREAM ("device:inode") names.
+    static bool isJournalStream(const char* journalStream, int fd);
+
   private:
     bool debug_ = false;
     bool private_ = false;
+    bool journal_ = false;
     std::mutex mutex_;
 };
 

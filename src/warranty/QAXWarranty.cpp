@@ -17,6 +17,28 @@
 namespace qax {
 namespace {
 
+// A JSON null in a summary means the value is absent. Dropping nulls (from dictionaries and
+// arrays, at every depth) keeps the record representable as a property list, so it can be
+// cached and archived like any other.
+Value withoutNulls(Value value) {
+    if (auto* dictionary = value.asDictionary()) {
+        for (auto it = dictionary->begin(); it != dictionary->end();) {
+            if (it->second.isNull()) {
+                it = dictionary->erase(it);
+            } else {
+                it->second = withoutNulls(std::move(it->second));
+                ++it;
+            }
+        }
+    } else if (auto* array = value.asArray()) {
+        std::erase_if(*array, [](const Value& element) { return element.isNull(); });
+        for (auto& element : *array) {
+            element = withoutNulls(std::move(element));
+        }
+    }
+    return value;
+}
+
 // Containers of the coverage summary.
 constexpr const char* kFeatureToggleParameters = "featureToggleParameters";
 constexpr const char* kCoverage = "coverage";
@@ -259,7 +281,7 @@ std::shared_ptr<QAXWarranty> QAXWarranty::initWithDictionary(
 
 QAXWarranty::QAXWarranty(std::shared_ptr<Platform> platform, Value dictionary,
                          const std::optional<std::string>& /*serialNumber*/)
-    : platform_(std::move(platform)), dictionary_(std::move(dictionary)) {
+    : platform_(std::move(platform)), dictionary_(withoutNulls(std::move(dictionary))) {
     const Value& d = dictionary_;
     auto top = [&d](const char* key) { return d.find(key); };
     auto toggles = [&d](const char* key) { return nested(d, kFeatureToggleParameters, key); };

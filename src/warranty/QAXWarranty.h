@@ -369,9 +369,10 @@ class QAXWarranty {
                                                const Value& archive);
     static constexpr bool supportsSecureCoding() { return true; }
 
-    // The per-device cache on disk (defined with the cache).
-    void cacheWarranty(const std::optional<std::string>& serialNumber) const;
-    void cache() const;
+    // The per-device cache on disk (defined with the cache). False, with an error logged, when
+    // the file could not be written; the previous file then stays.
+    bool cacheWarranty(const std::optional<std::string>& serialNumber) const;
+    bool cache() const;
     static std::shared_ptr<QAXWarranty> cachedWarrantyForSerialNumber(
         std::shared_ptr<Platform> platform, const std::optional<std::string>& serialNumber);
     static std::shared_ptr<QAXWarranty> migrateLegacyCachedWarrantyIfNeededForSerialNumber(

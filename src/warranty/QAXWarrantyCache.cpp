@@ -69,20 +69,22 @@ std::string QAXWarranty::_warrantyPathForSerialNumberFormat(const Platform& plat
     return (fs::path(platform.homeDirectory) / kWarrantyFileFormat).string();
 }
 
-void QAXWarranty::cacheWarranty(const std::optional<std::string>& serialNumber) const {
+bool QAXWarranty::cacheWarranty(const std::optional<std::string>& serialNumber) const {
     const std::string path = pathForSerialNumber(*platform(), serialNumber);
     qaxLog().info("%s -> %@", "-[QAXWarranty cacheWarranty:]", path);
     std::error_code ignored;
     fs::create_directories(fs::path(path).parent_path(), ignored);
-    // A summary holding a null has no property-list form: nothing is written and the
-    // previous file stays.
-    if (auto xml = toXmlPlist(dictionaryRepresentation())) {
-        writeFileAtomically(path, *xml);
+    auto xml = toXmlPlist(dictionaryRepresentation());
+    std::string error = "the summary has no property-list form";
+    if (!xml || !writeFileAtomically(path, *xml, &error)) {
+        qaxLog().error("Unable to write the warranty cache %@: %@", path, error);
+        return false;
     }
+    return true;
 }
 
-void QAXWarranty::cache() const {
-    cacheWarranty(std::nullopt);
+bool QAXWarranty::cache() const {
+    return cacheWarranty(std::nullopt);
 }
 
 std::shared_ptr<QAXWarranty> QAXWarranty::cachedWarrantyForSerialNumber(

@@ -203,7 +203,12 @@ void QAXWarrantyDownloader::handleDownloadedDictionary(const std::string& serial
 
     const std::string locale = platform_->locale->preferredLocaleIdentifier();
     qaxLog().info("caching warranty for locale: '%@', version: %@", locale, kCacheVersion);
-    warranty->cacheWarranty(serialNumber);
+    if (!warranty->cacheWarranty(serialNumber)) {
+        // The keys describe the file on disk: stamping them over the previous file would make
+        // that older summary look freshly downloaded for this locale.
+        completion(true, std::move(warranty));
+        return;
+    }
 
     PreferenceStore& preferences = *platform_->preferences;
     const std::string hash = sha256Hash(serialNumber);
@@ -247,8 +252,9 @@ void QAXWarrantyDownloader::sendAttempt(const std::string& url, const std::strin
     if (isDefaultDevice(defaultDeviceSerialNumber(platform_), serialNumber)) {
         addKVAAuthenticationHeadersWithBody(request, *platform_, request.body().value_or(""));
     }
-    qaxLog().info("Headers: %@", headerDescription(request));
-    qaxLog().info("Body: %@", bodyDescription(request));
+    // The headers carry account tokens and the body the serial number: both are private.
+    qaxLog().info("Headers: %{private}@", headerDescription(request));
+    qaxLog().info("Body: %{private}@", bodyDescription(request));
 
     std::shared_ptr<HttpClient> http = platform_->http;
     if (!http) {
@@ -288,7 +294,8 @@ std::optional<Value> QAXWarrantyDownloader::dictionaryFromURL(const std::string&
     const auto serialURL = perSerialURL(fileURL, serialNumber);
     std::optional<std::string> data = readFileURL(serialURL);
     if (data) {
-        qaxLog().info("loading warranty from: %@", *serialURL);
+        // The per-serial file is named with the serial number in clear.
+        qaxLog().info("loading warranty from: %{private}@", *serialURL);
     } else {
         qaxLog().info("loading warranty from: %@", fileURL);
         data = readFileURL(fileURL);

@@ -10,6 +10,7 @@
 #include <set>
 #include <thread>
 
+#include "fakes/FakeServices.h"
 #include "fakes/TestHttpsServer.h"
 #include "fakes/TestPlatform.h"
 
@@ -251,6 +252,7 @@ TEST(CurlHttpClientTest, CachesGetAnswersThatAllowItUnlessTheRequestIgnoresTheCa
 }
 
 TEST(CurlHttpClientTest, DestructionCompletesOutstandingTransfersWithAnError) {
+    auto lifecycle = std::make_shared<test::FakeProcessLifecycle>();
     Gate gate;  // outlives the server's handler threads
     TestHttpsServer server;
     server.server().Get("/hang", [&gate](const httplib::Request&, httplib::Response& res) {
@@ -265,7 +267,9 @@ TEST(CurlHttpClientTest, DestructionCompletesOutstandingTransfersWithAnError) {
 
     std::atomic<int> calls{0}, errors{0};
     {
-        CurlHttpClient client(trusting(server));
+        auto options = trusting(server);
+        options.lifecycle = lifecycle;
+        CurlHttpClient client(options);
         for (int i = 0; i < 3; ++i) {
             client.send(HttpRequest(server.url("/hang")), [&](HttpResult r) {
                 ++calls;
@@ -273,9 +277,11 @@ TEST(CurlHttpClientTest, DestructionCompletesOutstandingTransfersWithAnError) {
             });
         }
         ASSERT_TRUE(gate.waitForInFlight(3));
+        EXPECT_EQ(lifecycle->transactionsOpen(), 3) << "each outstanding request keeps the agent";
     }
     EXPECT_EQ(calls.load(), 3);
     EXPECT_EQ(errors.load(), 3);
+    EXPECT_EQ(lifecycle->transactionsOpen(), 0);
     gate.release();
 
     // A completion may release the last reference to the client on the session thread.

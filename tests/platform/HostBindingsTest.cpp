@@ -1,18 +1,13 @@
 #include <gtest/gtest.h>
 
-#include "core/PlistCodec.h"
 #include "fakes/FakeServices.h"
 #include "fakes/TestPlatform.h"
 #include "platform/QAXUtilities.h"
-#include "platform/host/HostDeviceProperties.h"
 #include "platform/host/HostLocaleInfo.h"
 #include "platform/host/SystemClock.h"
 
 namespace qax {
 namespace {
-
-using test::TempDir;
-using test::writeFile;
 
 TEST(HostLocaleInfoTest, IdentifierFromEnvironment) {
     struct Row {
@@ -34,30 +29,6 @@ TEST(HostLocaleInfoTest, IdentifierFromEnvironment) {
         EXPECT_EQ(HostLocaleInfo::identifierFromEnvironment(r.lcAll, r.lcMessages, r.lang),
                   r.expected);
     }
-}
-
-TEST(HostDevicePropertiesTest, DevicePlistWithHostFallbacks) {
-    TempDir root;
-    writeFile(root.path() / "os-release", "NAME=\"Debian GNU/Linux\"\nVERSION_ID=\"12\"\n");
-    HostDeviceProperties props(root.str(), (root.path() / "os-release").string());
-
-    // No device.plist: the host's own facts, and no serial number.
-    EXPECT_EQ(props.copyDeviceProperty("ProductVersion"), Value("12"));
-    EXPECT_TRUE(props.copyDeviceProperty("ProductType").has_value());
-    EXPECT_FALSE(props.copyDeviceProperty("SerialNumber"));
-    EXPECT_FALSE(props.isInternalBuild());
-
-    auto device = toXmlPlist(Value(Value::Dictionary{
-        {"SerialNumber", "C02DEMO"}, {"ProductType", "Model9,1"}, {"InternalBuild", true}}));
-    writeFile(root.path() / "device.plist", *device);
-    EXPECT_EQ(props.copyDeviceProperty("SerialNumber"), Value("C02DEMO"));
-    EXPECT_EQ(props.copyDeviceProperty("ProductType"), Value("Model9,1"));
-    EXPECT_EQ(props.copyDeviceProperty("ProductVersion"), Value("12")) << "per-key fallback";
-    EXPECT_TRUE(props.isInternalBuild());
-
-    writeFile(root.path() / "device.plist", "not a plist");
-    EXPECT_FALSE(props.copyDeviceProperty("SerialNumber"));
-    EXPECT_FALSE(props.isInternalBuild());
 }
 
 TEST(SystemClockTest, ReportsNowAndTheLocalOffset) {

@@ -120,16 +120,25 @@ TEST_F(QAXWarrantyCacheTest, FileContentThatIsNoRecord) {
     }
 }
 
-TEST_F(QAXWarrantyCacheTest, SummaryHoldingANullKeepsThePreviousFile) {
-    make(summary("good"))->cacheWarranty("S");
-    const fs::path file = cacheDirectory() / (sha256Hash("S") + "_Warranty.plist");
-    const std::string before = test::readFile(file);
+TEST_F(QAXWarrantyCacheTest, NullsAreAbsentValuesAndAFailedWriteKeepsThePreviousFile) {
+    // A null means "absent": the record leaves it out, so it caches and reads back.
+    Value withNull = summary("nulls");
+    withNull["coverage"] = Value(Value::Dictionary{{"nested", Value(nullptr)}, {"kept", 1}});
+    withNull["list"] = Value(Value::Array{Value(nullptr), Value("x")});
+    ASSERT_TRUE(make(withNull)->cacheWarranty("S"));
+    Value expected = summary("nulls");
+    expected["coverage"] = Value(Value::Dictionary{{"kept", 1}});
+    expected["list"] = Value(Value::Array{Value("x")});
+    EXPECT_EQ(
+        QAXWarranty::cachedWarrantyForSerialNumber(tp.platform, "S")->dictionaryRepresentation(),
+        expected);
 
-    Value withNull = summary("bad");
-    withNull["coverage"] = Value(Value::Dictionary{{"nested", Value(nullptr)}});
-    make(withNull)->cacheWarranty("S");
-    EXPECT_EQ(test::readFile(file), before);
-    EXPECT_EQ(std::distance(fs::directory_iterator(cacheDirectory()), fs::directory_iterator()), 1);
+    // A cache file that cannot be replaced (here a directory stands in its place) is reported.
+    const fs::path blocked = cacheDirectory() / (sha256Hash("T") + "_Warranty.plist");
+    fs::create_directories(blocked / "occupied");
+    EXPECT_FALSE(make(summary("t"))->cacheWarranty("T"));
+    EXPECT_TRUE(fs::is_directory(blocked / "occupied"));
+    EXPECT_EQ(tp.log->countContaining("Unable to write the warranty cache"), 1);
 }
 
 TEST_F(QAXWarrantyCacheTest, LegacyMigration) {

@@ -230,6 +230,24 @@ TEST_F(QAXWarrantyDownloaderTest, OnlyUnauthorizedIsRetriedAndFailuresKeepTheCac
     }
 }
 
+TEST_F(QAXWarrantyDownloaderTest, AnUnwritableCacheLeavesTheKeysAlone) {
+    const CacheState before = seedCache(kThisDevice);
+    // A directory where the new file would be renamed to: the write fails, the old keys must
+    // not start describing a file that was never written.
+    const auto path = QAXWarranty::_warrantyPathForSerialNumberFormat(*tp.platform);
+    std::string file = path;
+    file.replace(file.rfind("%@"), 2, sha256Hash(kThisDevice));
+    std::filesystem::remove(file);
+    std::filesystem::create_directories(std::filesystem::path(file) / "occupied");
+    script({{200, summaryText_}});
+
+    Result result = download(kThisDevice);
+    EXPECT_TRUE(result.success);
+    EXPECT_EQ(cacheState(kThisDevice).date, before.date);
+    EXPECT_EQ(cacheState(kThisDevice).locale, before.locale);
+    EXPECT_EQ(cacheState(kThisDevice).version, before.version);
+}
+
 TEST_F(QAXWarrantyDownloaderTest, ThisDeviceAndOtherDevicesUseTheirOwnEndpoints) {
     ASSERT_TRUE(download(kThisDevice).success);
     ASSERT_TRUE(download("WATCH-1").success);

@@ -12,6 +12,7 @@
 #include <signal.h>
 
 #include <charconv>
+#include <chrono>
 #include <cstdio>
 #include <cstdlib>
 #include <filesystem>
@@ -198,6 +199,10 @@ int main(int argc, char** argv) {
         sigwait(&set, &sig);
         sim.stop();
         server.stop();
+        // The server's workers wait out idle keep-alive connections (seconds) before the
+        // listener returns; every request is already logged, so a stopped simulator exits now.
+        std::this_thread::sleep_for(std::chrono::milliseconds(200));
+        std::_Exit(0);
     });
     signals.detach();
     std::printf("coverage-sim listening on %s\n", base.c_str());

@@ -23,13 +23,6 @@ using qax::Value;
 // poll() takes milliseconds in an int; "no limit" is eleven days.
 constexpr double kNoLimitSeconds = 1e6;
 
-bool socketExists(const std::string& runtimeDirectory) {
-    std::error_code ec;
-    return std::filesystem::is_socket(
-        qax::HostServiceListenerFactory::socketPath(runtimeDirectory, qax::kQAXAgentServiceName),
-        ec);
-}
-
 // The agent closing on a client it refuses shows as the end of the stream, or as a failed
 // write when the request was still being sent.
 bool closedByAgent(const std::string& error) {
@@ -39,27 +32,21 @@ bool closedByAgent(const std::string& error) {
 
 }  // namespace
 
-std::string agentRuntimeDirectory() {
+std::string agentSocketPath() {
     const auto env = qax::HostEnvironment::fromProcessEnvironment();
-    if (socketExists(env.runtimeDirectory)) {
-        return env.runtimeDirectory;
-    }
-    if (const char* xdg = std::getenv("XDG_RUNTIME_DIR"); xdg && *xdg) {
-        const std::string units = (std::filesystem::path(xdg) / "qaxagent").string();
-        if (socketExists(units)) {
-            return units;
-        }
-    }
-    return env.runtimeDirectory;
+    return qax::HostServiceListenerFactory::clientSocketPath(env.runtimeDirectory,
+                                                             qax::kQAXAgentServiceName);
+}
+
+std::string agentRuntimeDirectory() {
+    return std::filesystem::path(agentSocketPath()).parent_path().string();
 }
 
 int callAgent(const std::string& op, const Value::Array& args, double timeoutSeconds,
               const std::function<int(const std::optional<Value>&)>& onReply) {
     qax::HostIpcClient client;
     std::string error;
-    const std::string path = qax::HostServiceListenerFactory::socketPath(agentRuntimeDirectory(),
-                                                                         qax::kQAXAgentServiceName);
-    if (!client.connect(path, &error)) {
+    if (!client.connect(agentSocketPath(), &error)) {
         std::fprintf(stderr, "qaxctl: %s (is qaxagent running?)\n", error.c_str());
         return kExitUnavailable;
     }

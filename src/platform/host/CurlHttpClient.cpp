@@ -34,6 +34,7 @@ constexpr int kIdlePollMilliseconds = 1000;
 
 constexpr const char* kCancelledError = "The session was invalidated before the request completed";
 constexpr const char* kTooLargeError = "The response body exceeds the session's size limit";
+constexpr const char* kRequestTransaction = "HTTP request";
 
 void initializeCurlOnce() {
     static std::once_flag once;
@@ -513,7 +514,7 @@ CurlHttpClient::Options CurlHttpClient::optionsForPlatformRoot(const std::string
 CurlHttpClient::CurlHttpClient() : CurlHttpClient(Options{}) {}
 
 CurlHttpClient::CurlHttpClient(Options options)
-    : session_(std::make_shared<Session>(std::move(options))) {
+    : lifecycle_(options.lifecycle), session_(std::make_shared<Session>(std::move(options))) {
     session_->start();
 }
 
@@ -522,6 +523,12 @@ CurlHttpClient::~CurlHttpClient() {
 }
 
 void CurlHttpClient::send(const HttpRequest& request, std::function<void(HttpResult)> completion) {
+    if (lifecycle_) {
+        // Let go once the completion has run and been dropped.
+        completion = [completion = std::move(completion),
+                      transaction = lifecycle_->beginTransaction(kRequestTransaction)](
+                         HttpResult result) { completion(std::move(result)); };
+    }
     session_->send(request, std::move(completion));
 }
 

@@ -2,7 +2,8 @@
 // transfers at once, a small in-memory cache for GET answers that allow it, and trust of an
 // extra CA (tls.plist "ExtraCAFile") next to the system CAs. send() may be called from any
 // thread, completions included; every completion runs once, on the session's thread.
-// Destroying the session cancels what is outstanding (each completion gets an error).
+// Destroying the session cancels what is outstanding (each completion gets an error). Each
+// outstanding request holds a transaction of the process lifecycle, when one is given.
 #pragma once
 
 #include <cstddef>
@@ -13,6 +14,7 @@
 
 #include "core/Clock.h"
 #include "platform/HttpClient.h"
+#include "platform/ProcessLifecycle.h"
 
 namespace qax {
 
@@ -29,6 +31,8 @@ class CurlHttpClient : public HttpClient {
         std::size_t maxBodyBytes = 32 * 1024 * 1024;
         // Time for cache expiry; the system clock when none.
         std::shared_ptr<Clock> clock;
+        // Kept from exiting while a request is outstanding; none in tools.
+        std::shared_ptr<ProcessLifecycle> lifecycle;
     };
 
     // The platform root's tls.plist decides the extra CA (a relative path is taken from the
@@ -46,6 +50,7 @@ class CurlHttpClient : public HttpClient {
     class Session;
 
   private:
+    std::shared_ptr<ProcessLifecycle> lifecycle_;
     std::shared_ptr<Session> session_;
 };
 

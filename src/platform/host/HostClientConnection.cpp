@@ -27,10 +27,12 @@ constexpr const char* kErrorKey = "error";
 
 }  // namespace
 
-HostClientConnection::HostClientConnection(Socket socket, std::shared_ptr<TaskRunner> requestQueue)
+HostClientConnection::HostClientConnection(Socket socket, std::shared_ptr<TaskRunner> requestQueue,
+                                           std::shared_ptr<void> transaction)
     : socket_(std::move(socket)),
       idleTimer_(socket_.get_executor()),
-      requestQueue_(std::move(requestQueue)) {
+      requestQueue_(std::move(requestQueue)),
+      transaction_(std::move(transaction)) {
     readBuffer_.resize(kReadChunkBytes);
 }
 
@@ -245,6 +247,9 @@ void HostClientConnection::closeNow() {
     asio::error_code ec;
     socket_.shutdown(Socket::shutdown_both, ec);
     socket_.close(ec);
+    // A request still running keeps the connection object, but no longer the process: work
+    // that must finish holds a transaction of its own.
+    transaction_.reset();
     // The exported object goes once the requests still running have replied.
     std::lock_guard lock(mutex_);
     object_.reset();

@@ -3,7 +3,8 @@
 // exported interface calls the exported object) and writes run there, so a request answered
 // at once never changes threads. Replies may come from any thread and in any order; they are
 // encoded on the replying thread and written from the strand. The peer facts and the exported
-// interface and object are set by the listener before resume() and guarded by a mutex.
+// interface and object are set by the listener before resume() and guarded by a mutex. The
+// connection keeps the process alive (its lifecycle transaction) until it is closed.
 #pragma once
 
 #include <sys/types.h>
@@ -27,8 +28,10 @@ class HostClientConnection : public ClientConnection,
   public:
     using Socket = asio::local::stream_protocol::socket;
 
-    // `requestQueue` runs on the socket's strand.
-    HostClientConnection(Socket socket, std::shared_ptr<TaskRunner> requestQueue);
+    // `requestQueue` runs on the socket's strand. `transaction` is let go when the connection
+    // closes.
+    HostClientConnection(Socket socket, std::shared_ptr<TaskRunner> requestQueue,
+                         std::shared_ptr<void> transaction = nullptr);
     ~HostClientConnection() override;
 
     pid_t peerProcessIdentifier() const override;
@@ -67,6 +70,7 @@ class HostClientConnection : public ClientConnection,
     std::shared_ptr<ExportedObject> object_;
 
     // On the strand only.
+    std::shared_ptr<void> transaction_;
     IpcFrameCodec decoder_;
     std::string readBuffer_;
     std::deque<std::string> writeQueue_;

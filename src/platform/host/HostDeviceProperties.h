@@ -1,9 +1,13 @@
 // Device facts from device.plist under the platform root (SerialNumber, ProductType,
-// ProductVersion, InternalBuild). Where the file does not give ProductVersion or
-// ProductType, the host's own facts stand in (/etc/os-release VERSION_ID, the machine
-// type); there is no serial number then. Thread-safe.
+// ProductVersion, InternalBuild). Without that file the facts are the machine's own: the
+// serial number and product name from its DMI data, the system version from os-release
+// VERSION_ID, not an internal build. Where the file leaves out ProductType or ProductVersion
+// the machine's stand in; its serial number never does. The machine's facts are read once.
+// Thread-safe.
 #pragma once
 
+#include <mutex>
+#include <optional>
 #include <string>
 
 #include "platform/DeviceProperties.h"
@@ -14,16 +18,32 @@ namespace qax {
 class HostDeviceProperties : public DeviceProperties {
   public:
     explicit HostDeviceProperties(const std::string& platformRoot,
-                                  std::string osReleasePath = "/etc/os-release");
+                                  std::string osReleasePath = "/etc/os-release",
+                                  std::string dmiDirectory = "/sys/class/dmi/id");
 
     std::optional<Value> copyDeviceProperty(std::string_view name) override;
     bool isInternalBuild() override;
 
   private:
-    std::optional<Value> hostFact(std::string_view name) const;
+    struct MachineFacts {
+        std::optional<std::string> productType;
+        std::optional<std::string> systemVersion;
+    };
+
+    bool deviceFileExists() const;
+    const MachineFacts& machine();
+    MachineFacts readMachineFacts() const;
+    // Read only when asked for: a machine without one logs it once.
+    const std::optional<std::string>& machineSerialNumber();
+    std::optional<std::string> readSerialNumber() const;
 
     CachedPlistFile file_;
-    std::string osReleasePath_;
+    const std::string osReleasePath_;
+    const std::string dmiDirectory_;
+    std::once_flag machineOnce_;
+    MachineFacts machine_;
+    std::once_flag serialOnce_;
+    std::optional<std::string> serialNumber_;
 };
 
 }  // namespace qax

@@ -7,6 +7,7 @@
 #include <filesystem>
 #include <string_view>
 
+#include "core/AsioDispatcher.h"
 #include "platform/host/CurlHttpClient.h"
 #include "platform/host/FilePreferenceStore.h"
 #include "platform/host/HostAccountStore.h"
@@ -23,8 +24,10 @@
 #include "platform/host/HostNotificationSocket.h"
 #include "platform/host/HostPairedDeviceRegistry.h"
 #include "platform/host/HostProcessBundleLookup.h"
+#include "platform/host/HostProcessLifecycle.h"
 #include "platform/host/HostPurchaseHistory.h"
 #include "platform/host/HostServiceListenerFactory.h"
+#include "platform/host/HostSocketActivation.h"
 #include "platform/host/HostStoreLookup.h"
 #include "platform/host/HostSystemNotificationCenter.h"
 #include "platform/host/HostTelephonyInfo.h"
@@ -33,6 +36,25 @@
 #include "platform/host/SystemClock.h"
 
 namespace qax {
+
+std::optional<std::string> installedShareDirectory(const std::string& executablePath) {
+    namespace fs = std::filesystem;
+    const fs::path directory = fs::path(executablePath).parent_path();
+    fs::path prefix;
+    if (directory.filename() == "bin") {
+        prefix = directory.parent_path();
+    } else if (directory.filename() == "qaxagent" && directory.parent_path().filename() == "lib") {
+        prefix = directory.parent_path().parent_path();
+    } else {
+        return std::nullopt;
+    }
+    std::error_code ec;
+    const fs::path share = prefix / "share" / "qaxagent";
+    if (!fs::is_directory(share, ec)) {
+        return std::nullopt;
+    }
+    return share.string();
+}
 
 HostEnvironment HostEnvironment::fromProcessEnvironment() {
     HostEnvironment env;
@@ -52,7 +74,14 @@ HostEnvironment HostEnvironment::fromProcessEnvironment() {
     env.runtimeDirectory =
         run && *run ? std::string(run) : (std::filesystem::path(env.platformRoot) / "run").string();
     const char* share = std::getenv("QAX_SHARE_DIR");
-    env.shareDirectory = share && *share ? std::string(share) : std::string(QAX_SOURCE_SHARE_DIR);
+    if (share && *share) {
+        env.shareDirectory = share;
+    } else {
+        std::error_code ec;
+        const auto self = std::filesystem::read_symlink("/proc/self/exe", ec);
+        env.shareDirectory = (ec ? std::nullopt : installedShareDirectory(self.string()))
+                                 .value_or(QAX_SOURCE_SHARE_DIR);
+    }
     const char* clock = std::getenv("QAX_CLOCK");
     env.simulatedClock = clock && std::string_view(clock) == "simulated";
     return env;
@@ -80,8 +109,24 @@ std::shared_ptr<Platform> makeHostPlatform(const HostEnvironment& environment,
     p->deviceProperties = std::make_shared<HostDeviceProperties>(environment.platformRoot);
     p->locale = std::make_shared<HostLocaleInfo>(p->platformRoot);
 
-    p->http =
-        std::make_shared<CurlHttpClient>(CurlHttpClient::optionsForPlatformRoot(p->platformRoot));
+    std::optional<int> passedSocket;
+    auto asio = std::dynamic_pointer_cast<AsioDispatcher>(p->dispatcher);
+    if (asio) {
+        passedSocket = HostSocketActivation::takeListeningSocket();
+    }
+    auto lifecycle = std::make_shared<HostProcessLifecycle>(
+        passedSocket.has_value(), HostProcessLifecycle::idleExitSecondsFromEnvironment(),
+        asio ? asio->mainQueue() : nullptr, [weak = std::weak_ptr<AsioDispatcher>(asio)] {
+            if (auto dispatcher = weak.lock()) {
+                dispatcher->stopMainLoop();
+            }
+        });
+    lifecycle->start();
+    p->lifecycle = lifecycle;
+
+    auto httpOptions = CurlHttpClient::optionsForPlatformRoot(p->platformRoot);
+    httpOptions.lifecycle = p->lifecycle;
+    p->http = std::make_shared<CurlHttpClient>(std::move(httpOptions));
     // Further host bindings are installed here, one line each.
     p->pairedDevices = std::make_shared<HostPairedDeviceRegistry>(p->platformRoot);
     p->featureFlags = std::make_shared<HostFeatureFlags>(p->platformRoot);
@@ -93,7 +138,7 @@ std::shared_ptr<Platform> makeHostPlatform(const HostEnvironment& environment,
     p->applications = std::make_shared<HostApplicationRegistry>(p->platformRoot);
     p->processes = std::make_shared<HostProcessBundleLookup>(p->applications);
     p->ipc = std::make_shared<HostServiceListenerFactory>(p->runtimeDirectory, p->dispatcher,
-                                                          p->applications);
+                                                          p->applications, lifecycle, passedSocket);
     auto notificationSocket = std::make_shared<HostNotificationSocket>(p->runtimeDirectory);
     p->notifications = std::make_shared<HostSystemNotificationCenter>(notificationSocket);
     p->launchEvents = std::make_shared<HostLaunchEventStream>(notificationSocket, p->dispatcher);

@@ -14,30 +14,40 @@
 #include "core/Log.h"
 #include "platform/host/HostClientConnection.h"
 #include "platform/host/HostPeerVerifier.h"
+#include "platform/host/HostProcessLifecycle.h"
 #include "platform/host/HostUnixSocketPath.h"
 
 namespace qax {
 namespace {
 
 constexpr auto kAcceptRetryDelay = std::chrono::milliseconds(100);
+constexpr const char* kConnectionTransaction = "client connection";
 
 }  // namespace
 
 HostServiceListener::HostServiceListener(std::string serviceName, std::string socketPath,
                                          std::shared_ptr<AsioDispatcher> dispatcher,
-                                         std::shared_ptr<ApplicationRegistry> applications)
+                                         std::shared_ptr<ApplicationRegistry> applications,
+                                         std::shared_ptr<HostProcessLifecycle> lifecycle,
+                                         std::optional<int> passedSocket)
     : serviceName_(std::move(serviceName)),
       socketPath_(std::move(socketPath)),
       dispatcher_(std::move(dispatcher)),
       applications_(std::move(applications)),
       listenerQueue_(dispatcher_->makeSerialQueue(serviceName_ + ".listener")),
+      lifecycle_(std::move(lifecycle)),
+      passedSocket_(passedSocket),
       acceptor_(dispatcher_->mainContext()) {}
 
 HostServiceListener::~HostServiceListener() {
     if (listening_) {
         asio::error_code ec;
         acceptor_.close(ec);
-        ::unlink(socketPath_.c_str());
+        if (ownsPath_) {
+            ::unlink(socketPath_.c_str());
+        }
+    } else if (passedSocket_) {
+        ::close(*passedSocket_);
     }
 }
 
@@ -50,6 +60,32 @@ bool HostServiceListener::resume() {
     if (listening_) {
         return true;
     }
+    if (passedSocket_) {
+        asio::error_code ec;
+        acceptor_.assign(asio::local::stream_protocol(), *passedSocket_, ec);
+        if (ec) {
+            qaxLog().error("Cannot serve %@ on the passed socket: %@", serviceName_, ec.message());
+            return false;
+        }
+        passedSocket_.reset();
+    } else if (!bindSocketPath()) {
+        return false;
+    } else {
+        ownsPath_ = true;
+    }
+    listening_ = true;
+    if (lifecycle_) {
+        lifecycle_->setAcceptGate([weak = weak_from_this()](bool accepting) {
+            if (auto self = weak.lock()) {
+                self->setAccepting(accepting);
+            }
+        });
+    }
+    acceptNext();
+    return true;
+}
+
+bool HostServiceListener::bindSocketPath() {
     std::string error;
     if (!HostUnixSocketPath::claim(socketPath_, SOCK_STREAM, &error)) {
         qaxLog().error("Cannot listen for %@: %@", serviceName_, error);
@@ -81,16 +117,39 @@ bool HostServiceListener::resume() {
         }
         return false;
     }
-    listening_ = true;
-    acceptNext();
     return true;
 }
 
+void HostServiceListener::setAccepting(bool accepting) {
+    if (accepting_ == accepting) {
+        return;
+    }
+    accepting_ = accepting;
+    if (!accepting) {
+        // An accept that has already taken a client off the socket still completes with it
+        // (and that client is served); a waiting one stays queued on the socket.
+        asio::error_code ec;
+        acceptor_.cancel(ec);
+        return;
+    }
+    acceptNext();
+}
+
 void HostServiceListener::acceptNext() {
+    if (!listening_ || !accepting_ || acceptPending_) {
+        return;
+    }
+    acceptPending_ = true;
     acceptor_.async_accept([self = shared_from_this()](
                                const asio::error_code& ec,
                                asio::local::stream_protocol::socket socket) {
-        if (ec == asio::error::operation_aborted || !self->listening_) {
+        self->acceptPending_ = false;
+        if (!self->listening_) {
+            return;
+        }
+        if (ec == asio::error::operation_aborted) {
+            // Stopped for a look before exiting; accepting may have resumed since.
+            self->acceptNext();
             return;
         }
         if (!ec) {
@@ -106,8 +165,10 @@ void HostServiceListener::acceptNext() {
                 self->acceptNext();
                 return;
             }
-            auto connection =
-                std::make_shared<HostClientConnection>(std::move(onStrand), strand.queue);
+            auto connection = std::make_shared<HostClientConnection>(
+                std::move(onStrand), strand.queue,
+                self->lifecycle_ ? self->lifecycle_->beginTransaction(kConnectionTransaction)
+                                 : nullptr);
             const auto id = self->nextConnection_++;
             self->connections_[id] = connection;
             // Forget connections that have gone, now and then, so the table stays small.
@@ -125,7 +186,7 @@ void HostServiceListener::acceptNext() {
         auto timer = std::make_shared<asio::steady_timer>(self->dispatcher_->mainContext(),
                                                           kAcceptRetryDelay);
         timer->async_wait([self, timer](const asio::error_code& waitError) {
-            if (!waitError && self->listening_) {
+            if (!waitError) {
                 self->acceptNext();
             }
         });
@@ -163,7 +224,9 @@ void HostServiceListener::invalidate() {
     listening_ = false;
     asio::error_code ec;
     acceptor_.close(ec);
-    ::unlink(socketPath_.c_str());
+    if (ownsPath_) {
+        ::unlink(socketPath_.c_str());
+    }
     for (auto& [id, weak] : connections_) {
         if (auto connection = weak.lock()) {
             connection->close();

@@ -1,0 +1,119 @@
+// The agent's whole download path as a client sees it: a forced all-devices request makes the
+// running agent negotiate, sign, attest and fetch each device's summary from the real
+// coverage-sim and cache it; with the service stopped, cached-only and default-policy requests
+// still answer the same warranties, and a forced download fails without touching the cache.
+#include <gtest/gtest.h>
+
+#include <map>
+#include <memory>
+
+#include "AgentProcess.h"
+#include "CoverageSimProcess.h"
+#include "platform/host/FilePreferenceStore.h"
+#include "platform/host/HostIpcClient.h"
+
+namespace qax {
+namespace {
+
+constexpr double kWait = 60;
+constexpr const char* kPhone = "ITEST-DL-PHONE";
+constexpr const char* kWatch = "ITEST-DL-WATCH";
+constexpr const char* kAllDeviceInfos = "getAllDeviceInfosUsingPolicy:updateFollowUps:withReply:";
+
+// Serial number -> the summary of its warranty (none when the device came without one).
+using Answers = std::map<std::string, std::optional<Value>>;
+
+Answers answersOf(const Value& reply) {
+    Answers out;
+    for (const Value& info : *reply.asArray()) {
+        const Value* serial = info.find("device")->find("serialNumber");
+        const Value* warranty = info.find("warranty");
+        out[*serial->asString()] =
+            warranty ? std::optional<Value>(*warranty->find("DictionaryRepresentation"))
+                     : std::nullopt;
+    }
+    return out;
+}
+
+TEST(DownloadThroughCoverageSim, ForcedDownloadThenCachedAnswersWithTheServiceStopped) {
+    test::AgentProcess agent;
+    const std::string root = agent.platformRoot();
+    auto sim = std::make_unique<test::CoverageSimProcess>(
+        agent.home() + "/sim", root,
+        std::vector<std::string>{"--attestation-root", root + "/state/attestation/ca.pem"});
+    ASSERT_FALSE(sim->base().empty()) << "coverage-sim did not start";
+
+    agent.writeRootFile("device.plist", Value::Dictionary{{"SerialNumber", kPhone},
+                                                          {"ProductType", "Phone1,1"},
+                                                          {"ProductVersion", "1.0"}});
+    agent.writeRootFile("paired-devices.plist",
+                        Value::Array{Value::Dictionary{{"name", "Watch"},
+                                                       {"serialNumber", kWatch},
+                                                       {"pairedDate", Date(1700000000)},
+                                                       {"isPaired", true},
+                                                       {"isArchived", false}}});
+    agent.writeRootFile("features.plist",
+                        Value::Dictionary{{"Kestova", Value::Dictionary{{"Tessel_3_0", true}}}});
+    agent.writeRootFile(
+        "accounts.plist",
+        Value::Dictionary{
+            {"PrimaryCloudAccount", Value::Dictionary{{"altDSID", "primary"}}},
+            {"KFAccount",
+             Value::Dictionary{{"altDSID", "kf"}, {"TokenServiceURL", sim->base() + "/token"}}}});
+    FilePreferenceStore preferences(FilePreferenceStore::domainPath(agent.home()));
+    preferences.setObject("ServerVersionURL", sim->base() + "/library/VELMORA/asset/qaxV2.plist");
+    preferences.setObject("WarrantyURL", sim->base() + "/api/v3/coverage/summary");
+    preferences.setObject("WearablesWarrantyURL", sim->base() + "/api/v2/coverage/summary");
+    agent.registerApplication("tests", test::selfExecutable(), std::nullopt, Value(true));
+    ASSERT_TRUE(agent.start()) << agent.log();
+
+    HostIpcClient client;
+    std::string error;
+    ASSERT_TRUE(client.connect(agent.socketPath(), &error)) << error;
+    auto call = [&](const std::string& op, Value::Array args) -> std::optional<Value> {
+        auto reply = client.call(op, args, kWait, &error);
+        EXPECT_TRUE(reply && !reply->error) << op << ": " << error;
+        return reply ? reply->value : std::nullopt;
+    };
+
+    // Forced: both devices are fetched; only this device's request is attested, and the
+    // service verified it.
+    auto forced = call(kAllDeviceInfos, {Value(2), Value(false)});
+    ASSERT_TRUE(forced && forced->isArray());
+    const Answers downloaded = answersOf(*forced);
+    ASSERT_EQ(downloaded.size(), 2u);
+    ASSERT_TRUE(downloaded.at(kPhone) && downloaded.at(kWatch)) << agent.log();
+    std::map<std::string, std::string> attestation;
+    for (const Value& request : sim->requestLog()) {
+        const std::string path = *request.find("path")->asString();
+        if (path.find("/coverage/summary") != std::string::npos) {
+            const Value* body = request.find("body");
+            const std::string serial =
+                body->asString()->find(kPhone) != std::string::npos ? kPhone : kWatch;
+            attestation[serial] = *request.find("attestation")->asString();
+        }
+    }
+    EXPECT_EQ(attestation[kPhone], "valid");
+    EXPECT_EQ(attestation[kWatch], "absent");
+
+    // The service goes away; the cache answers alone.
+    sim.reset();
+    auto cached = call(kAllDeviceInfos, {Value(1), Value(false)});
+    ASSERT_TRUE(cached && cached->isArray());
+    EXPECT_EQ(answersOf(*cached), downloaded);
+    auto fresh = call("getDeviceInfoForSerialNumber:usingPolicy:withReply:", {kPhone, Value(0)});
+    ASSERT_TRUE(fresh && fresh->find("warranty"));
+    EXPECT_EQ(*fresh->find("warranty")->find("DictionaryRepresentation"), *downloaded.at(kPhone));
+
+    // A forced download now fails: no warranty in the answer, and the cache is untouched.
+    auto failed = call(kAllDeviceInfos, {Value(2), Value(false)});
+    ASSERT_TRUE(failed && failed->isArray());
+    EXPECT_EQ(answersOf(*failed), (Answers{{kPhone, std::nullopt}, {kWatch, std::nullopt}}));
+    EXPECT_GE(agent.countInLog("qaxagent failed to load warranty"), 2);
+    auto after = call(kAllDeviceInfos, {Value(1), Value(false)});
+    ASSERT_TRUE(after && after->isArray());
+    EXPECT_EQ(answersOf(*after), downloaded);
+}
+
+}  // namespace
+}  // namespace qax

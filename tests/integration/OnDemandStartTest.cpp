@@ -1,0 +1,169 @@
+// The agent started on demand, as the user's service manager runs it: the first connection
+// starts it, it exits once idle, the next connection starts it again, and nothing is lost in
+// between (preferences kept, a client arriving while it exits served by the next instance).
+#include <gtest/gtest.h>
+#include <poll.h>
+#include <sys/socket.h>
+#include <sys/un.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <filesystem>
+#include <thread>
+
+#include "AgentProcess.h"
+#include "SpawnedProcess.h"
+#include "devices/QAXDevice.h"
+#include "platform/host/HostIpcClient.h"
+
+namespace qax {
+namespace {
+
+constexpr double kWait = 10;
+constexpr const char* kIdleExit = "QAX_IDLE_EXIT_SECONDS=1";
+constexpr const char* kExitedIdle = "Exiting after 1 seconds without a client";
+
+int bindUnixSocket(int type, const std::string& path) {
+    const int fd = ::socket(AF_UNIX, type | SOCK_CLOEXEC, 0);
+    sockaddr_un address{.sun_family = AF_UNIX, .sun_path = {}};
+    std::snprintf(address.sun_path, sizeof address.sun_path, "%s", path.c_str());
+    return ::bind(fd, reinterpret_cast<sockaddr*>(&address), sizeof address) == 0 ? fd : -1;
+}
+
+std::string receiveNotice(int fd) {
+    pollfd p{fd, POLLIN, 0};
+    char buffer[512];
+    const ssize_t n = ::poll(&p, 1, 10'000) == 1 ? ::recv(fd, buffer, sizeof buffer, 0) : -1;
+    return n > 0 ? std::string(buffer, static_cast<std::size_t>(n)) : "";
+}
+
+bool exitedCleanly(const std::optional<int>& status) {
+    return status && WIFEXITED(*status) && WEXITSTATUS(*status) == 0;
+}
+
+std::optional<std::string> serialIn(const std::optional<Value>& reply) {
+    auto device = reply ? QAXDevice::decode(*reply) : nullptr;
+    return device ? device->serialNumber() : std::nullopt;
+}
+
+class OnDemandStartTest : public ::testing::Test {
+  protected:
+    void SetUp() override {
+        agent.writeRootFile("device.plist",
+                            Value(Value::Dictionary{{"SerialNumber", Value("OD-SN-1")},
+                                                    {"InternalBuild", Value(true)}}));
+        agent.registerApplication("tests", test::selfExecutable(), std::nullopt, Value(true));
+        std::filesystem::create_directories(agent.runtimeDirectory());
+    }
+
+    // The default device's serial number, asked on `client` (connected first if need be).
+    std::optional<std::string> defaultSerial(HostIpcClient& client) {
+        std::string error;
+        if (!client.isConnected() && !client.connect(agent.socketPath(), &error)) {
+            return std::nullopt;
+        }
+        auto reply = client.call("defaultDevice:", {}, kWait, &error);
+        return reply ? serialIn(reply->value) : std::nullopt;
+    }
+
+    std::string logPath() const { return agent.home() + "/agent.log"; }
+
+    test::AgentProcess agent;  // its home, platform root and environment; started here instead
+};
+
+TEST_F(OnDemandStartTest, FirstConnectionStartsItIdleEndsItTheNextStartsItAgainWithStateKept) {
+    const auto activator = test::findProgram("systemd-socket-activate");
+    if (!activator) {
+        GTEST_SKIP() << "systemd-socket-activate (Debian package systemd) is not installed";
+    }
+    // Listens on the agent's socket and starts the agent with it on the first connection.
+    auto listen = [&] {
+        std::vector<std::string> args{"-l", agent.socketPath(), "-E", kIdleExit};
+        for (const auto& variable : agent.environment()) {
+            args.insert(args.end(), {"-E", variable});
+        }
+        args.push_back(QAX_AGENT_BINARY);
+        const int before = agent.countInLog("Listening on");
+        auto process = std::make_unique<test::SpawnedProcess>(*activator, args, agent.environment(),
+                                                              logPath());
+        EXPECT_TRUE(agent.waitForLog("Listening on", before + 1, kWait)) << agent.log();
+        return process;
+    };
+
+    auto first = listen();
+    EXPECT_EQ(agent.countInLog("launched"), 0) << "nothing starts the agent before a client";
+    {
+        HostIpcClient client;
+        EXPECT_EQ(defaultSerial(client), "OD-SN-1") << agent.log();
+        std::this_thread::sleep_for(std::chrono::milliseconds(2500));
+        EXPECT_TRUE(first->running()) << "a connected client keeps the agent past its idle time";
+        auto written = test::runTool(QAX_CTL_BINARY,
+                                     {"defaults", "write", "SerialNumber", "-string", "OD-KEPT"},
+                                     agent.environment());
+        ASSERT_EQ(written.status, 0) << written.err;
+        EXPECT_EQ(defaultSerial(client), "OD-KEPT");
+    }
+    EXPECT_TRUE(exitedCleanly(first->waitForExit(kWait))) << agent.log();
+    EXPECT_EQ(agent.countInLog(kExitedIdle), 1);
+
+    auto second = listen();
+    HostIpcClient client;
+    EXPECT_EQ(defaultSerial(client), "OD-KEPT") << agent.log();
+    client.close();
+    EXPECT_EQ(agent.countInLog("Started on demand"), 2);
+    EXPECT_TRUE(exitedCleanly(second->waitForExit(kWait))) << agent.log();
+}
+
+// The service manager keeps its listening socket across instances: this test holds one the
+// same way, hands it to each instance and reads their readiness notices.
+TEST_F(OnDemandStartTest, AClientArrivingWhileTheAgentExitsIsServedByTheNextInstance) {
+    const int listening = bindUnixSocket(SOCK_STREAM, agent.socketPath());
+    ASSERT_EQ(::listen(listening, 16), 0);
+    const std::string notifyPath = agent.home() + "/manager-notify";
+    const int notices = bindUnixSocket(SOCK_DGRAM, notifyPath);
+    ASSERT_GE(notices, 0);
+    auto start = [&] {
+        auto environment = agent.environment();
+        environment.insert(environment.end(), {kIdleExit, "NOTIFY_SOCKET=" + notifyPath});
+        // A copy without close-on-exec for the shell, which moves it to descriptor 3 and names
+        // the agent's process id, as the service manager does.
+        const std::string inherited = std::to_string(::dup(listening));
+        auto process = std::make_unique<test::SpawnedProcess>(
+            "/bin/sh",
+            std::vector<std::string>{"-c",
+                                     "exec 3<&" + inherited + " " + inherited +
+                                         "<&-; LISTEN_PID=$$ LISTEN_FDS=1 exec \"$0\"",
+                                     QAX_AGENT_BINARY},
+            environment, logPath());
+        ::close(std::stoi(inherited));
+        return process;
+    };
+
+    auto first = start();
+    HostIpcClient client;
+    EXPECT_EQ(defaultSerial(client), "OD-SN-1") << agent.log();
+    client.close();
+    EXPECT_EQ(receiveNotice(notices), "READY=1\nSTATUS=Serving clients");
+    // Connects the moment the first instance decides to go.
+    ASSERT_TRUE(agent.waitForLog(kExitedIdle, 1, kWait)) << agent.log();
+    HostIpcClient late;
+    std::string error;
+    ASSERT_TRUE(late.connect(agent.socketPath(), &error)) << error;
+    ASSERT_TRUE(late.sendRequest(7, "defaultDevice:", {}, &error)) << error;
+    EXPECT_TRUE(exitedCleanly(first->waitForExit(kWait))) << agent.log();
+    EXPECT_EQ(receiveNotice(notices), "STOPPING=1");
+    EXPECT_TRUE(std::filesystem::is_socket(agent.socketPath())) << "the path is not the agent's";
+
+    auto second = start();
+    auto reply = late.receive(kWait, &error);
+    ASSERT_TRUE(reply) << error << "\n" << agent.log();
+    const Value* device = reply->find("reply");
+    EXPECT_EQ(serialIn(device ? std::optional(*device) : std::nullopt), "OD-SN-1");
+    late.close();
+    EXPECT_TRUE(exitedCleanly(second->waitForExit(kWait))) << agent.log();
+    ::close(listening);
+    ::close(notices);
+}
+
+}  // namespace
+}  // namespace qax
