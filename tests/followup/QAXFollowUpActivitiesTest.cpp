@@ -5,7 +5,6 @@
 #include "core/Hash.h"
 #include "fakes/FakeAgent.h"
 #include "fakes/FakeAgentFactory.h"
-#include "fakes/FakeAnalyticsSink.h"
 #include "fakes/FakeBackgroundActivities.h"
 #include "fakes/FakeFollowUpCenter.h"
 #include "fakes/TestPlatform.h"
@@ -19,16 +18,18 @@
 namespace qax {
 namespace {
 
+using Opt = std::optional<double>;
 constexpr double kHour = 3600;
 constexpr double kDay = 86400;
+constexpr Opt none;
 constexpr const char* kClient = "com.velmora.Kestova";
+constexpr const char* kPost = kQAXFollowUpPostActivityIdentifier;
+constexpr const char* kRefresh = kQAXFollowUpRefreshActivityIdentifier;
 
-// One device as a test describes it; offsets are seconds from now, none leaves the date out.
+// One device; dates are seconds from now, none leaves the date out.
 struct Dev {
     const char* serial;
-    std::optional<double> activation;
-    std::optional<double> display;
-    std::optional<double> until;
+    Opt activation, display, until;
     bool displayed = true;
     bool posted = false;
 };
@@ -39,38 +40,32 @@ class FollowUpActivitiesTest : public ::testing::Test {
         qax_registerDefaults(prefs);
         factory().setAgent(agent);
     }
-
     test::FakeAgentFactory& factory() {
         return static_cast<test::FakeAgentFactory&>(*tp.platform->agentFactory);
     }
-    Date at(double seconds) const { return tp.clock->now().byAdding(seconds); }
-    std::int64_t epoch(double seconds) const {
-        return static_cast<std::int64_t>(at(seconds).secondsSince1970());
+    std::optional<Date> at(Opt seconds) const {
+        return seconds ? std::optional<Date>(tp.clock->now().byAdding(*seconds)) : std::nullopt;
     }
-
     QAXDeviceInfoList infos(const std::vector<Dev>& devices) {
         QAXDeviceInfoList out;
         Value::Array posted;
         for (const Dev& d : devices) {
             Value::Dictionary summary{
-                {"hvLocalizedOfferLabel", "Add the plan"},
                 {"hvLocalizedOfferPluralDescFormat", "%@ days left"},
-                {"hvLocalizedOfferSingularDesc", "Last day"},
                 {"featureToggleParameters",
                  Value(Value::Dictionary{{"hvOfferDisplay", d.displayed},
                                          {"hvOfferDurationDaysBeforeEndDate", 30}})}};
-            if (d.display) {
-                summary["hvOfferFollowupDisplayDate"] = epoch(*d.display);
-            }
-            if (d.until) {
-                summary["hvOfferEligibleUntil"] = epoch(*d.until);
+            for (auto [key, offset] : {std::pair{"hvOfferFollowupDisplayDate", d.display},
+                                       std::pair{"hvOfferEligibleUntil", d.until}}) {
+                if (offset) {
+                    summary[key] = static_cast<std::int64_t>(at(offset)->secondsSince1970());
+                }
             }
             if (d.posted) {
                 posted.push_back(Value(sha256Hash(d.serial)));
             }
-            auto activation = d.activation ? std::optional<Date>(at(*d.activation)) : std::nullopt;
             out.push_back(QAXDeviceInfo::deviceInfoWithDevice(
-                QAXDevice::deviceWithName("Phone", std::string(d.serial), activation,
+                QAXDevice::deviceWithName("Phone", std::string(d.serial), at(d.activation),
                                           QAXDeviceTypeDefault),
                 QAXWarranty::initWithDictionary(tp.platform, Value(std::move(summary)))));
         }
@@ -80,12 +75,7 @@ class FollowUpActivitiesTest : public ::testing::Test {
     std::optional<Date> target(const char* identifier) {
         return prefs.dateForKey(QAXScheduler::targetDateKey(identifier));
     }
-    std::shared_ptr<test::FakeBackgroundActivity> platformActivity(const char* identifier) {
-        return std::static_pointer_cast<test::FakeBackgroundActivityScheduler>(
-                   tp.platform->activities)
-            ->activity(identifier);
-    }
-    // Runs `activity` once and collects what it reports.
+    // Runs `activity` once; what it reports is collected in the returned list.
     std::shared_ptr<std::vector<std::int64_t>> run(
         const std::shared_ptr<QAXSchedulerActivityDelegate>& activity) {
         auto results = std::make_shared<std::vector<std::int64_t>>();
@@ -95,9 +85,10 @@ class FollowUpActivitiesTest : public ::testing::Test {
         tp.runner->runUntilIdle();
         return results;
     }
-    std::vector<FollowUpItem> items() {
+    std::size_t items() {
         return std::static_pointer_cast<test::InMemoryFollowUpCenter>(tp.platform->followUps)
-            ->items(kClient);
+            ->items(kClient)
+            .size();
     }
 
     test::TestPlatform tp;
@@ -105,173 +96,146 @@ class FollowUpActivitiesTest : public ::testing::Test {
     std::shared_ptr<test::FakeAgent> agent = std::make_shared<test::FakeAgent>();
 };
 
-TEST_F(FollowUpActivitiesTest, NextPostDate) {
-    const std::optional<double> none;
+TEST_F(FollowUpActivitiesTest, NextPostAndRefreshDates) {
+    enum Kind { Post, Refresh, RefreshNotInitial };
     struct Row {
         const char* what;
+        Kind kind;
         std::vector<Dev> devices;
-        std::optional<double> expected;
-    };
-    const Row rows[] = {
-        {"earliest display date",
-         {{"A", none, 3 * kDay, 60 * kDay}, {"B", none, 10 * kDay, 60 * kDay}},
-         3 * kDay},
-        {"a posted device is skipped",
-         {{"A", none, 3 * kDay, 60 * kDay, true, true}, {"B", none, 10 * kDay, 60 * kDay}},
-         10 * kDay},
-        {"eligibility ends before the display date", {{"A", none, 5 * kDay, 2 * kDay}}, 2 * kDay},
-        {"a later activation date is the candidate",
-         {{"A", 7 * kDay, 3 * kDay, 60 * kDay}},
-         7 * kDay},
-        {"no display date and no activation: only the end counts",
-         {{"A", none, 30 * kDay, 60 * kDay}, {"B", none, none, 20 * kDay}},
-         20 * kDay},
-        {"an ended offer listed first ends the walk in the past",
-         {{"A", none, -30 * kDay, -1 * kDay}, {"B", none, 3 * kDay, 60 * kDay}},
-         -1 * kDay},
-        {"nothing posted-able",
-         {{"A", none, 3 * kDay, 60 * kDay, false}, {"B", none, 3 * kDay, 60 * kDay, true, true}},
-         none},
-        {"a missing end of eligibility turns a future result into none",
-         {{"A", none, 3 * kDay, 60 * kDay}, {"B", none, 3 * kDay, none}},
-         none},
-        {"a display date already past gives no candidate",
-         {{"A", -2 * kDay, -1 * kDay, 9 * kDay}},
-         none},
-    };
-    for (const Row& row : rows) {
-        SCOPED_TRACE(row.what);
-        const auto date =
-            QAXFollowUpPost::nextFollowUpPostDateWithDevicesInfo(*tp.platform, infos(row.devices));
-        EXPECT_EQ(date, row.expected ? std::optional<Date>(at(*row.expected)) : std::nullopt);
-    }
-}
-
-TEST_F(FollowUpActivitiesTest, NextRefreshDate) {
-    const std::optional<double> none;
-    struct Row {
-        const char* what;
-        std::vector<Dev> devices;
-        bool initial;
-        std::optional<double> expected;
+        Opt expected;
         double oneDay = kDay;
     };
+    const double d = kDay, h = kHour;
+    // clang-format off
     const Row rows[] = {
-        {"4 days left: the count drops in 5 hours",
-         {{"A", -60 * kDay, -30 * kDay, 3 * kDay + 5 * kHour}},
-         true,
-         5 * kHour},
-        {"exactly 3 days left: in 1 day", {{"A", -60 * kDay, -30 * kDay, 3 * kDay}}, true, kDay},
-        {"the last day: none", {{"A", -60 * kDay, -30 * kDay, 20 * kHour}}, true, none},
-        {"an offer still to be posted: its start",
-         {{"A", -60 * kDay, 2 * kDay, 30 * kDay}},
-         true,
-         2 * kDay},
-        {"the earliest drop over two devices",
-         {{"A", -60 * kDay, -30 * kDay, 3 * kDay + 5 * kHour},
-          {"B", -60 * kDay, -30 * kDay, 2 * kDay + 3 * kHour}},
-         true,
-         3 * kHour},
-        {"no displayed device, not the initial call: one day",
-         {{"A", -60 * kDay, -30 * kDay, 9 * kDay, false}},
-         false,
-         kDay},
-        {"hour-long days", {{"A", -60 * kDay, -30 * kDay, 3.5 * kHour}}, true, 0.5 * kHour, kHour},
-        {"no start in the past (display date past, no activation): no day step",
-         {{"A", none, -30 * kDay, 3 * kDay + 5 * kHour}},
-         true,
-         none},
+        {"earliest display date", Post,
+         {{"A", none, 3 * d, 60 * d}, {"B", none, 10 * d, 60 * d}}, 3 * d},
+        {"a posted device is skipped", Post,
+         {{"A", none, 3 * d, 60 * d, true, true}, {"B", none, 10 * d, 60 * d}}, 10 * d},
+        {"the end before the display date", Post, {{"A", none, 5 * d, 2 * d}}, 2 * d},
+        {"a later activation is the candidate", Post, {{"A", 7 * d, 3 * d, 60 * d}}, 7 * d},
+        {"no display date nor activation: only the end counts", Post,
+         {{"A", none, 30 * d, 60 * d}, {"B", none, none, 20 * d}}, 20 * d},
+        {"an ended offer listed first ends the walk", Post,
+         {{"A", none, -30 * d, -d}, {"B", none, 3 * d, 60 * d}}, -d},
+        {"nothing left to post", Post,
+         {{"A", none, 3 * d, 60 * d, false}, {"B", none, 3 * d, 60 * d, true, true}}, none},
+        {"a missing end turns a future result into none", Post,
+         {{"A", none, 3 * d, 60 * d}, {"B", none, 3 * d, none}}, none},
+        {"a display date already past is no candidate", Post, {{"A", -2 * d, -d, 9 * d}}, none},
+        {"4 days left: the count drops in 5 h", Refresh, {{"A", -60 * d, -30 * d, 3 * d + 5 * h}},
+         5 * h},
+        {"exactly 3 days left: in 1 day", Refresh, {{"A", -60 * d, -30 * d, 3 * d}}, d},
+        {"the last day: none", Refresh, {{"A", -60 * d, -30 * d, 20 * h}}, none},
+        {"an offer still to be posted: its start", Refresh, {{"A", -60 * d, 2 * d, 30 * d}}, 2 * d},
+        {"the earliest drop of two", Refresh,
+         {{"A", -60 * d, -30 * d, 3 * d + 5 * h}, {"B", -60 * d, -30 * d, 2 * d + 3 * h}}, 3 * h},
+        {"nothing displayed, not the initial call", RefreshNotInitial,
+         {{"A", -60 * d, -30 * d, 9 * d, false}}, d},
+        {"hour-long days", Refresh, {{"A", -60 * d, -30 * d, 3.5 * h}}, 0.5 * h, h},
+        {"no start in the past, no day step", Refresh, {{"A", none, -30 * d, 3 * d + 5 * h}}, none},
+        // 0 days left wraps the day step around to 4,294,967,295 days, and the walk stops.
+        {"an ended offer", Refresh, {{"A", -60 * d, -30 * d, -h}, {"B", -60 * d, 2 * d, 30 * d}},
+         -h - 4294967295.0 * d},
     };
+    // clang-format on
     for (const Row& row : rows) {
         SCOPED_TRACE(row.what);
         prefs.setObject(settings::kOneDayInterval, Value(row.oneDay));
-        const auto date = QAXFollowUpRefresh::nextFollowUpRefreshDateWithDevicesInfo(
-            *tp.platform, infos(row.devices), row.initial);
-        EXPECT_EQ(date, row.expected ? std::optional<Date>(at(*row.expected)) : std::nullopt);
+        const auto list = infos(row.devices);
+        const auto date =
+            row.kind == Post
+                ? QAXFollowUpPost::nextFollowUpPostDateWithDevicesInfo(*tp.platform, list)
+                : QAXFollowUpRefresh::nextFollowUpRefreshDateWithDevicesInfo(*tp.platform, list,
+                                                                             row.kind == Refresh);
+        EXPECT_EQ(date, at(row.expected));
     }
-
-    // An ended offer (0 days left) wraps the day step around to the largest count: the result
-    // lies about 4,294,967,295 days back and the walk stops there.
-    prefs.setObject(settings::kOneDayInterval, Value(kDay));
-    const auto ended = QAXFollowUpRefresh::nextFollowUpRefreshDateWithDevicesInfo(
-        *tp.platform,
-        infos({{"A", -60 * kDay, -30 * kDay, -kHour}, {"B", -60 * kDay, 2 * kDay, 30 * kDay}}),
-        true);
-    ASSERT_TRUE(ended);
-    EXPECT_EQ(*ended, at(-kHour - 4294967295.0 * kDay));
 }
 
-TEST_F(FollowUpActivitiesTest, PostRunPostsDueDevicesAndSchedulesWhatComesNext) {
+TEST_F(FollowUpActivitiesTest, RunsPostRefreshAndScheduleWhatComesNext) {
     struct Row {
         const char* what;
-        std::optional<std::vector<Dev>> devices;  // none: no agent
+        bool post;                              // else a refresh run
+        std::optional<std::vector<Dev>> reply;  // none: no agent to ask
         std::int64_t result;
-        std::size_t posted;
-        std::optional<double> nextPost;
-        std::optional<double> refresh;
+        std::size_t itemsAfter;
+        Opt nextPost, nextRefresh;
+        const char* logged;
     };
+    const Dev due{"A", -10 * kDay, -kDay, 30 * kDay};
+    const Dev later{"A", -10 * kDay, 3 * kDay, 30 * kDay};
+    const Dev shown{"A", -60 * kDay, -30 * kDay, 3 * kDay + 5 * kHour};
+    // clang-format off
     const Row rows[] = {
-        {"a due device is posted and the refresh starts",
-         std::vector<Dev>{{"A", -10 * kDay, -kDay, 30 * kDay}}, QAXActivityResultFinished, 1,
-         std::nullopt, kDay},
-        {"an offer opening later re-schedules the post",
-         std::vector<Dev>{{"A", -10 * kDay, 3 * kDay, 30 * kDay}}, QAXActivityResultFinished, 0,
-         3 * kDay, std::nullopt},
-        {"no devices", std::vector<Dev>{}, QAXActivityResultFinished, 0, std::nullopt,
-         std::nullopt},
-        {"no device infos at all", std::nullopt, QAXActivityResultDeferred, 0, std::nullopt,
-         std::nullopt},
+        {"post: a due device is posted, the refresh starts", true, {{due}}, 1, 1, none, kDay,
+         "Schedule refresh for: "},
+        {"post: an offer opening later re-schedules the post", true, {{later}}, 1, 0, 3 * kDay,
+         none, "Re-schedule followUp post for: "},
+        {"post: no devices", true, {{}}, 1, 0, none, none, " -> (\n)"},
+        {"post: no device infos", true, std::nullopt, 2, 0, none, none,
+         "Unable to load devices info, defer"},
+        {"refresh: a shown item is updated and chains", false, {{shown}}, 1, 1, none, 5 * kHour,
+         "Followup present, schedule refresh for "},
+        {"refresh: a device no longer known is cleared", false, {{}}, 1, 0, none, none,
+         "No followups present, don't schedule another refresh"},
+        {"refresh: no device infos", false, std::nullopt, 2, 1, none, none,
+         "Unable to load device info for followup refresh, defer"},
     };
+    // clang-format on
     for (const Row& row : rows) {
         SCOPED_TRACE(row.what);
         tp.log->clear();
-        for (const char* id :
-             {kQAXFollowUpPostActivityIdentifier, kQAXFollowUpRefreshActivityIdentifier}) {
-            prefs.removeObject(QAXScheduler::targetDateKey(id));
-        }
+        prefs.removeObject(QAXScheduler::targetDateKey(kPost));
+        prefs.removeObject(QAXScheduler::targetDateKey(kRefresh));
         std::static_pointer_cast<test::InMemoryFollowUpCenter>(tp.platform->followUps)
             ->clearPendingFollowUpItemsWithUniqueIdentifiers(
-                kClient, {"com.velmora.Kestova." + sha256Hash("A")}, nullptr);
-        agent->setInfos(row.devices ? infos(*row.devices) : QAXDeviceInfoList{});
-        factory().setAgent(row.devices ? agent : nullptr);
+                kClient, {QAXFollowUp::uniqueIdentfierForSerialNumber(std::string("A"))}, nullptr);
+        if (!row.post) {
+            QAXFollowUp(tp.platform).postFollowUpWithDeviceInfo(infos({shown})[0]);
+        }
+        agent->setInfos(row.reply ? infos(*row.reply) : QAXDeviceInfoList{});
+        factory().setAgent(row.reply ? agent : nullptr);
 
-        auto results = run(std::make_shared<QAXFollowUpPost>(tp.platform));
-        EXPECT_EQ(*results, std::vector<std::int64_t>{row.result});
-        EXPECT_EQ(items().size(), row.posted);
-        EXPECT_EQ(target(kQAXFollowUpPostActivityIdentifier),
-                  row.nextPost ? std::optional<Date>(at(*row.nextPost)) : std::nullopt);
-        EXPECT_EQ(target(kQAXFollowUpRefreshActivityIdentifier),
-                  row.refresh ? std::optional<Date>(at(*row.refresh)) : std::nullopt);
-        EXPECT_EQ(tp.log->count("Unable to load devices info, defer"), row.devices ? 0 : 1);
+        std::shared_ptr<QAXSchedulerActivityDelegate> activity;
+        if (row.post) {
+            activity = std::make_shared<QAXFollowUpPost>(tp.platform);
+        } else {
+            activity = std::make_shared<QAXFollowUpRefresh>(tp.platform);
+        }
+        EXPECT_EQ(*run(activity), std::vector<std::int64_t>{row.result});
+        EXPECT_EQ(items(), row.itemsAfter);
+        EXPECT_EQ(target(kPost), at(row.nextPost));
+        EXPECT_EQ(target(kRefresh), at(row.nextRefresh));
+        EXPECT_EQ(tp.log->countContaining(row.logged), 1) << row.logged;
     }
-    // Every run asked its own agent, on the post's behalf, for fresh downloads.
-    EXPECT_EQ(factory().agentCallers(),
-              std::vector<std::string>(4, "com.velmora.qaxagent.followuppost"));
-    for (const auto& request : agent->requests()) {
-        EXPECT_EQ(request.policy, QAXWarrantyPolicyForceDownload);
-        EXPECT_FALSE(request.updateFollowUps);
-    }
-    const auto& events =
-        std::static_pointer_cast<test::RecordingAnalyticsSink>(tp.platform->analytics)->events();
-    EXPECT_EQ(events.size(), 1u);
+    // Each run asked an agent of its own for fresh downloads (post) or the cache (refresh),
+    // without the agent's follow-up update.
+    const auto callers = factory().agentCallers();
+    EXPECT_EQ(callers.front(), "com.velmora.qaxagent.followuppost");
+    EXPECT_EQ(callers.back(), "com.velmora.qaxagent.followuprefresh");
+    const auto requests = agent->requests();
+    EXPECT_EQ(requests.front().policy, QAXWarrantyPolicyForceDownload);
+    EXPECT_EQ(requests.back().policy, QAXWarrantyPolicyCachedOnly);
+    EXPECT_FALSE(requests.front().updateFollowUps || requests.back().updateFollowUps);
 }
 
 TEST_F(FollowUpActivitiesTest, PostRunIsReportedOnceWhicheverPathEndsIt) {
     struct Row {
         const char* what;
-        bool shouldDefer;
-        bool timerFirst;
-        std::vector<std::int64_t> reported;
+        bool shouldDefer, timerFirst;
+        std::int64_t reported;
     };
     const Row rows[] = {
-        {"deferral check first", true, true, {QAXActivityResultDeferred}},
-        {"reply first", true, false, {QAXActivityResultFinished}},
-        {"the platform does not ask to defer", false, true, {QAXActivityResultFinished}},
+        {"deferral check first", true, true, QAXActivityResultDeferred},
+        {"reply first", true, false, QAXActivityResultFinished},
+        {"the platform does not ask to defer", false, true, QAXActivityResultFinished},
     };
     for (const Row& row : rows) {
         SCOPED_TRACE(row.what);
         tp.log->clear();
-        platformActivity(kQAXFollowUpPostActivityIdentifier)->setShouldDefer(row.shouldDefer);
+        std::static_pointer_cast<test::FakeBackgroundActivityScheduler>(tp.platform->activities)
+            ->activity(kPost)
+            ->setShouldDefer(row.shouldDefer);
         agent->setInfos(infos({{"A", -10 * kDay, -kDay, 30 * kDay}}));
         agent->hold(true);
         auto activity = std::make_shared<QAXFollowUpPost>(tp.platform);
@@ -283,62 +247,14 @@ TEST_F(FollowUpActivitiesTest, PostRunIsReportedOnceWhicheverPathEndsIt) {
         }
         EXPECT_EQ(agent->release(), 1u);
         tp.runner->advanceBy(35);
-        EXPECT_EQ(*results, row.reported);
+        EXPECT_EQ(*results, std::vector<std::int64_t>{row.reported});
         EXPECT_EQ(tp.log->count("FollowUp Post activity deferred."),
-                  row.reported[0] == QAXActivityResultDeferred ? 1 : 0);
+                  row.reported == QAXActivityResultDeferred ? 1 : 0);
         // The reply's work is done either way, and the run leaves nothing behind.
-        EXPECT_EQ(items().size(), 1u);
-        EXPECT_FALSE(activity->followUpPostInProgress());
-        EXPECT_FALSE(activity->followUpPostTimer());
+        EXPECT_EQ(items(), 1u);
+        EXPECT_FALSE(activity->followUpPostInProgress() || activity->followUpPostTimer());
         agent->hold(false);
     }
-}
-
-TEST_F(FollowUpActivitiesTest, RefreshRunKeepsShownItemsCurrentAndChainsWhileAnyIsShown) {
-    const auto shown = infos({{"A", -60 * kDay, -30 * kDay, 3 * kDay + 5 * kHour}});
-    struct Row {
-        const char* what;
-        bool itemPending;
-        std::optional<QAXDeviceInfoList> reply;  // none: no agent
-        std::int64_t result;
-        std::optional<double> next;
-        const char* logged;
-    };
-    const Row rows[] = {
-        {"a shown item is updated", true, shown, QAXActivityResultFinished, 5 * kHour,
-         "Followup present, schedule refresh for "},
-        {"nothing shown", false, shown, QAXActivityResultFinished, std::nullopt,
-         "No followups present, don't schedule another refresh"},
-        {"a device no longer known is cleared", true, QAXDeviceInfoList{},
-         QAXActivityResultFinished, std::nullopt,
-         "No followups present, don't schedule another refresh"},
-        {"no device infos", true, std::nullopt, QAXActivityResultDeferred, std::nullopt,
-         "Unable to load device info for followup refresh, defer"},
-    };
-    for (const Row& row : rows) {
-        SCOPED_TRACE(row.what);
-        tp.log->clear();
-        prefs.removeObject(QAXScheduler::targetDateKey(kQAXFollowUpRefreshActivityIdentifier));
-        if (row.itemPending) {
-            QAXFollowUp(tp.platform).postFollowUpWithDeviceInfo(shown[0]);
-        } else {
-            QAXFollowUp(tp.platform).dismissFollowUpForSerialNumber(std::string("A"));
-        }
-        agent->setInfos(row.reply.value_or(QAXDeviceInfoList{}));
-        factory().setAgent(row.reply ? agent : nullptr);
-
-        auto results = run(std::make_shared<QAXFollowUpRefresh>(tp.platform));
-        EXPECT_EQ(*results, std::vector<std::int64_t>{row.result});
-        EXPECT_EQ(target(kQAXFollowUpRefreshActivityIdentifier),
-                  row.next ? std::optional<Date>(at(*row.next)) : std::nullopt);
-        EXPECT_EQ(tp.log->countContaining(row.logged), 1) << row.logged;
-        EXPECT_EQ(items().size(), row.result == QAXActivityResultDeferred || row.next ? 1u : 0u);
-    }
-    for (const auto& request : agent->requests()) {
-        EXPECT_EQ(request.policy, QAXWarrantyPolicyCachedOnly);
-        EXPECT_FALSE(request.updateFollowUps);
-    }
-    EXPECT_EQ(factory().agentCallers().front(), "com.velmora.qaxagent.followuprefresh");
 }
 
 }  // namespace

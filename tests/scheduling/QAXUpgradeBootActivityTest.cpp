@@ -14,160 +14,135 @@
 namespace qax {
 namespace {
 
-using Scheduling = test::FakeAgentFactory::Scheduling;
+using Schedulings = std::vector<std::pair<std::string, std::optional<Date>>>;
 
 class UpgradeBootTest : public ::testing::Test {
   protected:
     UpgradeBootTest() { tp.platform->accounts = accounts; }
 
-    test::FakeAgentFactory& factory() {
-        return static_cast<test::FakeAgentFactory&>(*tp.platform->agentFactory);
-    }
-    std::vector<std::pair<std::string, std::optional<Date>>> schedulings() {
-        std::vector<std::pair<std::string, std::optional<Date>>> out;
-        for (const Scheduling& s : factory().schedulings()) {
+    Schedulings schedulings() {
+        Schedulings out;
+        for (const auto& s :
+             static_cast<test::FakeAgentFactory&>(*tp.platform->agentFactory).schedulings()) {
             out.emplace_back(s.identifier, s.date);
         }
         return out;
     }
-    std::int64_t run(QAXSchedulerActivityDelegate& activity) {
+    std::int64_t run(QAXSchedulerActivityDelegate&& activity) {
         std::int64_t result = 0;
         activity.performActivityForScheduler(nullptr, [&](std::int64_t r) { result = r; });
         return result;
     }
-    void setTarget(const char* identifier, Date date) {
-        prefs.setObject(QAXScheduler::targetDateKey(identifier), Value(date));
+    void setTarget(const std::string& identifier, std::optional<Date> date) {
+        const auto key = QAXScheduler::targetDateKey(identifier);
+        date ? prefs.setObject(key, Value(*date)) : prefs.removeObject(key);
     }
 
     test::TestPlatform tp;
     PreferenceStore& prefs = *tp.platform->preferences;
-    test::FakeDeviceProperties& device =
-        static_cast<test::FakeDeviceProperties&>(*tp.platform->deviceProperties);
     std::shared_ptr<test::FakeAccountStore> accounts = std::make_shared<test::FakeAccountStore>();
+    const Date now = tp.clock->now();
 };
 
-TEST_F(UpgradeBootTest, FirstUpgradeRunSetsUpAndSchedulesTheFirstOutreach) {
-    for (bool signedIn : {true, false}) {
-        SCOPED_TRACE(signedIn);
-        test::TestPlatform fresh;
-        fresh.platform->accounts = std::make_shared<test::FakeAccountStore>();
-        if (!signedIn) {
-            std::static_pointer_cast<test::FakeAccountStore>(fresh.platform->accounts)->primary =
-                nullptr;
-        }
-        PreferenceStore& p = *fresh.platform->preferences;
-        for (const char* id : {kQAXOutreachActivityIdentifier, kQAXFollowUpPostActivityIdentifier,
-                               "com.example.other"}) {
-            p.setObject(QAXScheduler::targetDateKey(id), Value(Date(5)));
-        }
-        p.setObject("UnrelatedKey", Value(1));
-
-        QAXPostUpgradeActivity activity(fresh.platform);
-        std::int64_t result = 0;
-        activity.performActivityForScheduler(nullptr, [&](std::int64_t r) { result = r; });
-
-        EXPECT_EQ(result, QAXActivityResultFinished);
-        for (const std::string& key : p.allKeys()) {
-            EXPECT_EQ(key.find(".TargetDate"), std::string::npos) << key;
-        }
-        EXPECT_TRUE(p.objectForKey("UnrelatedKey"));
-        EXPECT_EQ(p.dateForKey("DefaultDeviceActivationDate"), fresh.clock->now());
-        EXPECT_TRUE(p.boolForKey("PostUpgradeActivityCompleted"));
-        EXPECT_EQ(p.boolForKey("InitialOutreachActivityScheduled"), signedIn);
-        EXPECT_EQ(p.stringForKey("PostUpgradeOSVersionKey"), "4.2");
-        auto made =
-            static_cast<test::FakeAgentFactory&>(*fresh.platform->agentFactory).schedulings();
-        ASSERT_EQ(made.size(), signedIn ? 1u : 0u);
-        if (signedIn) {
-            EXPECT_EQ(made[0].identifier, kQAXOutreachActivityIdentifier);
-            EXPECT_EQ(made[0].date, fresh.clock->now());
-        }
-        EXPECT_EQ(fresh.log->count("No primary account detected. Finishing post upgrade activity "
-                                   "without scheduling outreach"),
-                  signedIn ? 0 : 1);
-    }
-}
-
-TEST_F(UpgradeBootTest, LaterUpgradeRunsForceOneConversionOutreachPerNewerVersion) {
+TEST_F(UpgradeBootTest, UpgradeRuns) {
     const std::optional<std::string> none;
     struct Row {
         const char* what;
-        std::optional<std::string> stored;
-        std::optional<std::string> current;
+        bool firstRun, signedIn;
+        std::optional<std::string> stored, current;
         bool outreachPending;
-        bool forces;
+        Schedulings scheduled;
+        const char* logged;
         std::optional<std::string> storedAfter;
     };
+    const char* kOutreach = kQAXOutreachActivityIdentifier;
+    const char* kConversion = kQAXConversionOutreachActivityIdentifier;
+    const char* kPerformed = "post upgrade activity already performed";
+    // clang-format off
     const Row rows[] = {
-        {"4.9 to 4.10", "4.9", "4.10", false, true, "4.10"},
-        {"4.9 to 4.10 with an outreach pending", "4.9", "4.10", true, false, "4.10"},
-        {"same version", "4.10", "4.10", false, false, "4.10"},
-        {"older version", "4.10", "4.9.9", false, false, "4.9.9"},
-        {"no version seen before", none, "4.2", false, true, "4.2"},
-        {"system version unavailable", "4.9", none, false, false, "4.9"},
+        {"first run, signed in", true, true, none, "4.2", true, {{kOutreach, now}},
+         "post upgrade activity hasn't yet been performed, perform upgrade activity", "4.2"},
+        {"first run, nobody signed in", true, false, none, "4.2", false, {},
+         "No primary account detected. Finishing post upgrade activity without scheduling outreach",
+         "4.2"},
+        {"4.9 to 4.10", false, true, "4.9", "4.10", false, {{kConversion, now}},
+         "Forcing conversion outreach on upgrade", "4.10"},
+        {"4.9 to 4.10, an outreach pending", false, true, "4.9", "4.10", true, {}, kPerformed,
+         "4.10"},
+        {"same version", false, true, "4.10", "4.10", false, {}, kPerformed, "4.10"},
+        {"older version", false, true, "4.10", "4.9.9", false, {}, kPerformed, "4.9.9"},
+        {"no version seen before", false, true, none, "4.2", false, {{kConversion, now}},
+         "Forcing conversion outreach on upgrade", "4.2"},
+        {"system version unavailable", false, true, "4.9", none, false, {},
+         "Unable to get OS version", "4.9"},
     };
+    // clang-format on
     for (const Row& row : rows) {
         SCOPED_TRACE(row.what);
-        tp.log->clear();
-        const auto before = factory().schedulings().size();
-        prefs.setObject("PostUpgradeActivityCompleted", Value(true));
-        row.stored ? prefs.setObject("PostUpgradeOSVersionKey", Value(*row.stored))
-                   : prefs.removeObject("PostUpgradeOSVersionKey");
-        row.outreachPending
-            ? setTarget(kQAXOutreachActivityIdentifier, tp.clock->now().byAdding(600))
-            : (void)prefs.removeObject(QAXScheduler::targetDateKey(kQAXOutreachActivityIdentifier));
-        device.set("ProductVersion",
-                   row.current ? std::optional<Value>(Value(*row.current)) : std::nullopt);
-
-        QAXPostUpgradeActivity activity(tp.platform);
-        EXPECT_EQ(run(activity), QAXActivityResultFinished);
-        const auto made = factory().schedulings();
-        ASSERT_EQ(made.size(), before + (row.forces ? 1 : 0));
-        if (row.forces) {
-            EXPECT_EQ(made.back().identifier, kQAXConversionOutreachActivityIdentifier);
-            EXPECT_EQ(made.back().date, tp.clock->now());
+        test::TestPlatform fresh;
+        tp.platform = fresh.platform;
+        accounts->primary = row.signedIn ? std::make_shared<Account>() : nullptr;
+        fresh.platform->accounts = accounts;
+        PreferenceStore& p = *fresh.platform->preferences;
+        p.setObject("PostUpgradeActivityCompleted", Value(!row.firstRun));
+        row.stored ? p.setObject("PostUpgradeOSVersionKey", Value(*row.stored))
+                   : p.removeObject("PostUpgradeOSVersionKey");
+        static_cast<test::FakeDeviceProperties&>(*fresh.platform->deviceProperties)
+            .set("ProductVersion", row.current ? std::optional(Value(*row.current)) : std::nullopt);
+        for (const char* id : {kOutreach, "com.example.other"}) {
+            p.setObject(QAXScheduler::targetDateKey(id), Value(now.byAdding(600)));
         }
-        EXPECT_EQ(tp.log->count("Forcing conversion outreach on upgrade"), row.forces ? 1 : 0);
-        EXPECT_EQ(tp.log->count("post upgrade activity already performed"), row.forces ? 0 : 1);
-        EXPECT_EQ(tp.log->count("Unable to get OS version"), row.current ? 0 : 1);
-        EXPECT_EQ(prefs.stringForKey("PostUpgradeOSVersionKey"), row.storedAfter);
+        if (!row.outreachPending) {
+            p.removeObject(QAXScheduler::targetDateKey(kOutreach));
+        }
+
+        EXPECT_EQ(run(QAXPostUpgradeActivity(fresh.platform)), QAXActivityResultFinished);
+        EXPECT_EQ(schedulings(), row.scheduled);
+        EXPECT_EQ(fresh.log->count(row.logged), 1) << row.logged;
+        EXPECT_EQ(p.stringForKey("PostUpgradeOSVersionKey"), row.storedAfter);
+        EXPECT_TRUE(p.boolForKey("PostUpgradeActivityCompleted"));
+        if (row.firstRun) {
+            // Every target date went; the device's activation date is now.
+            for (const std::string& key : p.allKeys()) {
+                EXPECT_EQ(key.find(".TargetDate"), std::string::npos) << key;
+            }
+            EXPECT_EQ(p.dateForKey("DefaultDeviceActivationDate"), now);
+            EXPECT_EQ(p.boolForKey("InitialOutreachActivityScheduled"), row.signedIn);
+        }
     }
 }
 
 TEST_F(UpgradeBootTest, BootRunReschedulesPendingWorkFromItsStoredDates) {
-    const Date past = tp.clock->now().byAdding(-3600);
-    const Date later = tp.clock->now().byAdding(7200);
+    const Date past = now.byAdding(-3600), later = now.byAdding(7200);
+    setTarget(kQAXOutreachActivityIdentifier, later);
+    setTarget(kQAXConversionOutreachActivityIdentifier, past);
+    setTarget(kQAXFollowUpRefreshActivityIdentifier, later);
+    setTarget(kQAXFollowUpPostActivityIdentifier, later);
 
     // Before the first upgrade run the boot does nothing.
-    setTarget(kQAXOutreachActivityIdentifier, later);
-    QAXPostBootActivity activity(tp.platform);
-    EXPECT_EQ(run(activity), QAXActivityResultFinished);
+    EXPECT_EQ(run(QAXPostBootActivity(tp.platform)), QAXActivityResultFinished);
     EXPECT_TRUE(
         tp.log->contains("post upgrade activity hasn't yet been performed, skip boot activity"));
     EXPECT_TRUE(schedulings().empty());
 
+    // After it: outreach, conversion outreach and refresh again for their dates; the post is
+    // left alone.
     prefs.setObject("PostUpgradeActivityCompleted", Value(true));
-    setTarget(kQAXConversionOutreachActivityIdentifier, past);
-    setTarget(kQAXFollowUpRefreshActivityIdentifier, later);
-    setTarget(kQAXFollowUpPostActivityIdentifier, later);
-    EXPECT_EQ(run(activity), QAXActivityResultFinished);
-    const std::vector<std::pair<std::string, std::optional<Date>>> expected = {
-        {kQAXOutreachActivityIdentifier, later},
-        {kQAXConversionOutreachActivityIdentifier, past},
-        {kQAXFollowUpRefreshActivityIdentifier, later},
-    };
+    EXPECT_EQ(run(QAXPostBootActivity(tp.platform)), QAXActivityResultFinished);
+    const Schedulings expected = {{kQAXOutreachActivityIdentifier, later},
+                                  {kQAXConversionOutreachActivityIdentifier, past},
+                                  {kQAXFollowUpRefreshActivityIdentifier, later}};
     EXPECT_EQ(schedulings(), expected);
     EXPECT_EQ(prefs.dateForKey("ConversionOutreachScheduledDate"), past);
-    EXPECT_TRUE(tp.log->contains("Running post boot activity"));
     EXPECT_TRUE(
         tp.log->contains("'com.velmora.qaxagent.conversionoutreach' not complete, rescheduling"));
 
-    // Nothing pending: nothing to re-schedule.
-    for (const std::string& key : prefs.allKeys()) {
-        prefs.removeObject(key);
+    // Nothing pending, nothing re-scheduled.
+    for (const char* id : {kQAXOutreachActivityIdentifier, kQAXConversionOutreachActivityIdentifier,
+                           kQAXFollowUpRefreshActivityIdentifier}) {
+        setTarget(id, std::nullopt);
     }
-    prefs.setObject("PostUpgradeActivityCompleted", Value(true));
-    EXPECT_EQ(run(activity), QAXActivityResultFinished);
+    EXPECT_EQ(run(QAXPostBootActivity(tp.platform)), QAXActivityResultFinished);
     EXPECT_EQ(schedulings().size(), expected.size());
 }
 
