@@ -34,6 +34,17 @@ std::string describeCarriers(const std::vector<SubscriberCarrier>& carriers) {
     return text + ")";
 }
 
+// The devices in the bracketed list form of logs.
+std::string describeDevices(const QAXDeviceMap& devices) {
+    std::string text = "(\n";
+    std::size_t i = 0;
+    for (const auto& [serial, device] : devices) {
+        text += "    " + (device ? device->description() : std::string("(null)"));
+        text += ++i < devices.size() ? ",\n" : "\n";
+    }
+    return text + ")";
+}
+
 bool toggleContains(const std::optional<Value>& toggle, const std::string& identifier) {
     const Value::Array* list = toggle ? toggle->asArray() : nullptr;
     if (!list) {
@@ -110,7 +121,7 @@ void QAXOutreachActivityUtilities::performOutreachActivityForConversion(
 
     const QAXDeviceMap devices = devices_->allDevices();
     qaxLog().info("%s: -- Conversion: %d -- devices: %@", kPerformOperation, conversion ? 1 : 0,
-                  QAXDevice::describeDevices(devices));
+                  describeDevices(devices));
 
     const Download download =
         downloads_(conversion ? kConversionOutreachCallingProcess : kOutreachCallingProcess);
