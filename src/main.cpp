@@ -7,19 +7,26 @@
 #include <asio/io_context.hpp>
 #include <asio/signal_set.hpp>
 #include <memory>
+#include <vector>
 
 #include "agent/QAXAgent.h"
+#include "agent/QAXAgentFactory.h"
 #include "agent/QAXAgentRemoteInterface.h"
 #include "agent/QAXLaunchEventHandler.h"
 #include "agent/ServiceDelegate.h"
 #include "core/AsioDispatcher.h"
 #include "core/Log.h"
+#include "devices/QAXLocaleMonitor.h"
+#include "devices/QAXPairedDevicesMonitor.h"
+#include "followup/QAXFollowUp.h"
+#include "followup/QAXFollowUpPost.h"
 #include "platform/LaunchEventStream.h"
 #include "platform/PreferenceStore.h"
 #include "platform/QAXSettings.h"
 #include "platform/ServiceListener.h"
 #include "platform/host/HostPlatform.h"
 #include "platform/host/HostSocketActivation.h"
+#include "scheduling/QAXScheduler.h"
 
 namespace {
 
@@ -44,6 +51,9 @@ int main() {
 
     auto platform = makeHostPlatform(HostEnvironment::fromProcessEnvironment(), dispatcher);
     qaxLog().setSink(platform->log);
+    // Lower layers make agents and schedule activities through the platform; the factory holds
+    // the platform weakly.
+    platform->agentFactory = std::make_shared<QAXAgentFactory>(platform);
 
     // Start-up, in order: announce the launch,
     qaxLog().info("launched");
@@ -51,24 +61,43 @@ int main() {
     // register the default settings,
     qax_registerDefaults(*platform->preferences);
 
-    // (the six activity schedulers join here. In this order, each made with
-    // newSchedulerWithActivityDelegate: for a new activity and told
-    // monitorForScheduledActivity before the next is made: QAXPostUpgradeActivity,
-    // QAXPostBootActivity, QAXOutreachActivity, QAXFollowUpPost,
-    // QAXConversionOutreachActivity, QAXFollowUpRefresh. They live as long as the process.)
+    // attach a scheduler to each of the six activities, in this order (they live as long as the
+    // process),
+    std::vector<std::shared_ptr<QAXScheduler>> schedulers;
+    for (const char* identifier :
+         {kQAXPostUpgradeActivityIdentifier, kQAXPostBootActivityIdentifier,
+          kQAXOutreachActivityIdentifier, kQAXFollowUpPostActivityIdentifier,
+          kQAXConversionOutreachActivityIdentifier, kQAXFollowUpRefreshActivityIdentifier}) {
+        auto scheduler = QAXScheduler::newSchedulerWithActivityDelegate(
+            platform, QAXAgentFactory::newActivityDelegate(platform, identifier));
+        scheduler->monitorForScheduledActivity();
+        schedulers.push_back(std::move(scheduler));
+    }
 
-    // create the start-up agent,
+    // create the start-up agent and migrate, before any client is listened to,
     auto startupAgent = QAXAgent::initWithCallingProcessBundleID(platform, kStartupCallingProcess);
-    // The start-up migration joins here: startupAgent->performMigrationIfNeeded(), run
-    // synchronously before any client is listened to.
+    startupAgent->performMigrationIfNeeded();
 
-    // (the locale monitor joins here: QAXLocaleMonitor initWithAgent: startupAgent, start.)
+    // start the locale monitor,
+    auto localeMonitor = std::make_shared<QAXLocaleMonitor>(platform, startupAgent, [platform] {
+        return QAXFollowUp(platform).pendingFollowUpCount();
+    });
+    localeMonitor->start();
 
-    // (the paired-devices monitor joins here: QAXPairedDevicesMonitor initWithAgent:
-    // startupAgent, start. The launch-event handler below will hold it.)
+    // start the paired-devices monitor,
+    QAXPairedDevicesMonitor::FollowUpPostScheduling followUpPost;
+    followUpPost.nextFollowUpPostDate = [platform](const auto& deviceInfos) {
+        return QAXFollowUpPost::nextFollowUpPostDateWithDevicesInfo(*platform, deviceInfos);
+    };
+    followUpPost.scheduleFollowUpPost = [platform](Date date) {
+        platform->agentFactory->scheduleActivityForDate(kQAXFollowUpPostActivityIdentifier, date);
+    };
+    auto pairedDevicesMonitor =
+        std::make_shared<QAXPairedDevicesMonitor>(platform, startupAgent, std::move(followUpPost));
+    pairedDevicesMonitor->start();
 
     // install the launch-event handler,
-    auto launchEventHandler = std::make_shared<QAXLaunchEventHandler>();
+    auto launchEventHandler = std::make_shared<QAXLaunchEventHandler>(pairedDevicesMonitor);
     QAXLaunchEventHandler::install(*platform->launchEvents, launchEventHandler);
 
     // listen on the service name,

@@ -33,9 +33,9 @@ void QAXLaunchEventHandler::handleEvent(const LaunchEvent& event) {
     const std::string& name = *raw;
     qaxLog().info("got launched with notificationName: %@", name);
     if (name == kPairedDeviceDidPairNotification || name == kPairedDeviceDidUnpairNotification) {
-        // The paired-devices monitor's updatePariedDevicesFollowUp joins here; the handler will
-        // hold that monitor strongly. Until then a pairing event ends with the log line above.
-        return;
+        if (pairedDevicesMonitor_) {
+            pairedDevicesMonitor_->updatePariedDevicesFollowUp();
+        }
     }
 }
 

@@ -1,5 +1,5 @@
-// A test double of the agent factory: records every activity scheduling and hands out the
-// agent the test sets. Thread-safe.
+// A test double of the agent factory: records every activity scheduling and every agent asked
+// for (by calling process), and hands out the agent the test sets. Thread-safe.
 #pragma once
 
 #include <mutex>
@@ -16,8 +16,9 @@ class FakeAgentFactory : public AgentFactory {
         std::optional<Date> date;
     };
 
-    std::shared_ptr<QAXAgentProtocol> makeAgent(const std::string&) override {
+    std::shared_ptr<QAXAgentProtocol> makeAgent(const std::string& callingProcess) override {
         std::lock_guard lock(mutex_);
+        agentCallers_.push_back(callingProcess);
         return agent_;
     }
     void scheduleActivityForDate(const std::string& identifier, std::optional<Date> date) override {
@@ -32,11 +33,16 @@ class FakeAgentFactory : public AgentFactory {
         std::lock_guard lock(mutex_);
         return schedulings_;
     }
+    std::vector<std::string> agentCallers() {
+        std::lock_guard lock(mutex_);
+        return agentCallers_;
+    }
 
   private:
     std::mutex mutex_;
     std::shared_ptr<QAXAgentProtocol> agent_;
     std::vector<Scheduling> schedulings_;
+    std::vector<std::string> agentCallers_;
 };
 
 }  // namespace qax::test

@@ -115,9 +115,11 @@ void AgentProcess::registerApplication(const std::string& name, const std::strin
 
 std::vector<std::string> AgentProcess::environment() const {
     const char* path = std::getenv("PATH");
-    return {"HOME=" + home(), "QAX_PLATFORM_ROOT=" + platformRoot(),
-            "QAX_RUNTIME_DIR=" + runtimeDirectory(),
-            std::string("PATH=") + (path ? path : "/usr/bin:/bin")};
+    std::vector<std::string> env = {"HOME=" + home(), "QAX_PLATFORM_ROOT=" + platformRoot(),
+                                    "QAX_RUNTIME_DIR=" + runtimeDirectory(),
+                                    std::string("PATH=") + (path ? path : "/usr/bin:/bin")};
+    env.insert(env.end(), extraEnvironment.begin(), extraEnvironment.end());
+    return env;
 }
 
 bool AgentProcess::start() {

@@ -45,8 +45,11 @@ class AgentProcess {
     // Polls the log until `text` has appeared `times` times.
     bool waitForLog(const std::string& text, int times = 1, double seconds = 5) const;
 
-    // The environment the agent runs with (HOME, QAX_PLATFORM_ROOT, QAX_RUNTIME_DIR, PATH).
+    // The environment the agent runs with (HOME, QAX_PLATFORM_ROOT, QAX_RUNTIME_DIR, PATH, and
+    // the extra entries).
     std::vector<std::string> environment() const;
+    // "NAME=value" entries added to the agent's environment from the next start on.
+    std::vector<std::string> extraEnvironment;
 
   private:
     TempDir dir_;

@@ -373,7 +373,12 @@ void Simulator::summary(const httplib::Request& req, httplib::Response& res,
     }
     std::optional<Value> summary;
     const std::string& serialNumber = *serial->asString();
-    for (const std::string& name : {serialNumber + ".json", std::string("default.json")}) {
+    // A summary in the request's language comes first, so a language change can be followed.
+    const Value* locale = body->find("locale");
+    const std::string localeSuffix =
+        locale->isString() && !locale->asString()->empty() ? "." + *locale->asString() : "";
+    for (const std::string& name : {serialNumber + localeSuffix + ".json", serialNumber + ".json",
+                                    std::string("default.json")}) {
         if (!isPlainName(name)) {
             continue;
         }

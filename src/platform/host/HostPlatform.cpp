@@ -107,7 +107,7 @@ std::shared_ptr<Platform> makeHostPlatform(const HostEnvironment& environment,
     p->preferences = std::make_shared<FilePreferenceStore>(
         FilePreferenceStore::domainPath(environment.homeDirectory));
     p->deviceProperties = std::make_shared<HostDeviceProperties>(environment.platformRoot);
-    p->locale = std::make_shared<HostLocaleInfo>();
+    p->locale = std::make_shared<HostLocaleInfo>(p->platformRoot);
 
     std::optional<int> passedSocket;
     auto asio = std::dynamic_pointer_cast<AsioDispatcher>(p->dispatcher);
