@@ -121,6 +121,8 @@ class QaxctlExplainTest : public ::testing::Test {
                               {"hvLocalizedOfferPluralDescFormat", "%@ days left to add coverage"},
                               {"hvLocalizedOfferSingularDesc", "Last day to add coverage"},
                               {"hvNotificationLocalizedOfferLabel", "Coverage is ending soon"},
+            {"hvNotificationLocalizedOfferPluralDescFormat", "%@ days left to add the plan"},
+            {"hvNotificationLocalizedOfferSingularDesc", "Last day to add the plan"},
                               {"hvLocalizedOfferCTA", "Add Coverage"},
                               {"featureToggleParameters",
                                Value(Value::Dictionary{{"hvOfferDisplay", true},
