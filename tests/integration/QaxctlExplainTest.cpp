@@ -112,25 +112,25 @@ class QaxctlExplainTest : public ::testing::Test {
         auto ms = [&](double days) {
             return Value(static_cast<std::int64_t>((start + days * kDay) * 1000));
         };
-        return Value(
-            Value::Dictionary{{"covered", true},
-                              {"hvOfferEligible", true},
-                              {"hvOfferEligibleUntil", ms(endsInDays)},
-                              {"hvOfferFollowupDisplayDate", ms(-openedDaysAgo)},
-                              {"hvLocalizedOfferLabel", "Add the Haverly plan"},
-                              {"hvLocalizedOfferPluralDescFormat", "%@ days left to add coverage"},
-                              {"hvLocalizedOfferSingularDesc", "Last day to add coverage"},
-                              {"hvNotificationLocalizedOfferLabel", "Coverage is ending soon"},
+        return Value(Value::Dictionary{
+            {"covered", true},
+            {"hvOfferEligible", true},
+            {"hvOfferEligibleUntil", ms(endsInDays)},
+            {"hvOfferFollowupDisplayDate", ms(-openedDaysAgo)},
+            {"hvLocalizedOfferLabel", "Add the Haverly plan"},
+            {"hvLocalizedOfferPluralDescFormat", "%@ days left to add coverage"},
+            {"hvLocalizedOfferSingularDesc", "Last day to add coverage"},
+            {"hvNotificationLocalizedOfferLabel", "Coverage is ending soon"},
             {"hvNotificationLocalizedOfferPluralDescFormat", "%@ days left to add the plan"},
             {"hvNotificationLocalizedOfferSingularDesc", "Last day to add the plan"},
-                              {"hvLocalizedOfferCTA", "Add Coverage"},
-                              {"featureToggleParameters",
-                               Value(Value::Dictionary{{"hvOfferDisplay", true},
-                                                       {"hvOfferSettingsRowBadge", true},
-                                                       {"hvOfferDurationDaysBeforeEndDate", 30}})},
-                              {"hvOfferBadgeBeforeEndDate", 7},
-                              {"showNotificationToggle", true},
-                              {"showNotificationBeforeEndDate", 3}});
+            {"hvLocalizedOfferCTA", "Add Coverage"},
+            {"featureToggleParameters",
+             Value(Value::Dictionary{{"hvOfferDisplay", true},
+                                     {"hvOfferSettingsRowBadge", true},
+                                     {"hvOfferDurationDaysBeforeEndDate", 30}})},
+            {"hvOfferBadgeBeforeEndDate", 7},
+            {"showNotificationToggle", true},
+            {"showNotificationBeforeEndDate", 3}});
     }
 
     // The cache file and its keys, as a download leaves them.

@@ -12,7 +12,6 @@
 #include "devices/QAXDevicesManager.h"
 #include "followup/QAXFollowUpPost.h"
 #include "followup/QAXFollowUpRefresh.h"
-#include "platform/AccountStore.h"
 #include "platform/LocaleInfo.h"
 #include "platform/PreferenceStore.h"
 #include "platform/QAXSettings.h"
@@ -99,7 +98,9 @@ class LogBinding {
 // The cache file of `serialNumber`, named as the cache names it.
 std::string cacheFilePath(const qax::Platform& platform, const std::string& serialNumber) {
     std::string path = QAXWarranty::_warrantyPathForSerialNumberFormat(platform);
-    return path.replace(path.rfind("%@"), 2, qax::sha256Hash(serialNumber));
+    const auto at = path.rfind("%@");
+    return at == std::string::npos ? std::string()
+                                   : path.replace(at, 2, qax::sha256Hash(serialNumber));
 }
 
 const DryRunFollowUpCenter::Change* findChange(const std::vector<DryRunFollowUpCenter::Change>& all,
@@ -297,7 +298,7 @@ OfferExplanation OfferExplanation::explain(const qax::HostEnvironment& environme
     x.cache.validitySeconds = provider.cachedWarrantyValidityDuration();
     const auto cached = provider.cachedWarrantyForSerialNumber(serialNumber);
     if (const std::string path = cacheFilePath(*platform, serialNumber);
-        !cached && fs::exists(path, ec)) {
+        !cached && !path.empty() && fs::exists(path, ec)) {
         x.cache.unreadableFile = path;
     }
 
