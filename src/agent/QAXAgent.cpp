@@ -137,8 +137,51 @@ void QAXAgent::getWarrantyUsingPolicy(QAXWarrantyPolicy policy,
     getWarrantyUsingPolicy(policy, *serialNumber, std::move(reply));
 }
 
+QAXWarrantyPolicyEvaluation QAXAgent::evaluateWarrantyPolicy(const Platform& platform,
+                                                             QAXAgentWarrantyProvider& provider,
+                                                             QAXWarrantyPolicy policy,
+                                                             const std::string& serialNumber) {
+    using CacheState = QAXWarrantyPolicyEvaluation::CacheState;
+    QAXWarrantyPolicyEvaluation e;
+    e.policy = policy;
+    e.cached = provider.cachedWarrantyForSerialNumber(serialNumber);
+    if (e.cached) {
+        e.cachedVersion = provider.cachedWarrantyVersionForSerialNumber(serialNumber);
+        e.cachedLocale = provider.cachedWarrantyLocaleForSerialNumber(serialNumber);
+        e.currentLocale = platform.locale->preferredLocaleIdentifier();
+        if (e.cachedVersion != kCurrentCacheVersion) {
+            e.cacheState = CacheState::OutdatedVersion;
+        } else if (e.cachedLocale != e.currentLocale) {
+            e.cacheState = CacheState::OtherLocale;
+        } else if (!provider.isSignedInToSkyvault()) {
+            e.cacheState = CacheState::SignedOut;
+        } else {
+            e.cacheState = CacheState::Valid;
+            e.cacheValid = true;
+        }
+    }
+
+    if (policy == QAXWarrantyPolicyForceDownload) {
+        e.cacheValid = false;
+        e.shouldDownload = true;
+    } else if (policy == QAXWarrantyPolicyDefault && !e.cacheValid) {
+        e.shouldDownload = true;
+    } else if (policy == QAXWarrantyPolicyDefault) {
+        e.examinedExpiration = true;
+        e.lastUpdated = provider.lastUpdatedDateForSerialNumber(serialNumber);
+        if (e.lastUpdated) {
+            e.remaining = e.lastUpdated->timeIntervalSince(platform.clock->now()) +
+                          provider.cachedWarrantyValidityDuration();
+        }
+        // Exactly no time left counts as expired.
+        e.shouldDownload = !e.remaining || *e.remaining <= 0;
+    }
+    return e;
+}
+
 void QAXAgent::getWarrantyUsingPolicy(QAXWarrantyPolicy policy, const std::string& serialNumber,
                                       std::function<void(std::shared_ptr<QAXWarranty>)> reply) {
+    using CacheState = QAXWarrantyPolicyEvaluation::CacheState;
     static constexpr const char* kOperation =
         "-[QAXAgent getWarrantyUsingPolicy:serialNumber:withReply:]";
     qaxLog().info("getting warranty using policy %@: %lu", serialNumber,
@@ -149,74 +192,61 @@ void QAXAgent::getWarrantyUsingPolicy(QAXWarrantyPolicy policy, const std::strin
         reply(nullptr);
         return;
     }
-    bool cacheValid = false;
-    std::shared_ptr<QAXWarranty> cached = provider->cachedWarrantyForSerialNumber(serialNumber);
-    if (!cached) {
+    const QAXWarrantyPolicyEvaluation e =
+        evaluateWarrantyPolicy(*platform_, *provider, policy, serialNumber);
+    if (!e.cached) {
         qaxLog().info("no cached warranty : %@", serialNumber);
     } else {
         qaxLog().info("Has cached warranty : %@", serialNumber);
-        const auto version = provider->cachedWarrantyVersionForSerialNumber(serialNumber);
-        const auto locale = provider->cachedWarrantyLocaleForSerialNumber(serialNumber);
-        const std::string currentLocale = platform_->locale->preferredLocaleIdentifier();
-        if (version != kCurrentCacheVersion) {
-            qaxLog().info(
-                "cached warranty is of outdated version '%@', current version is '%@', consider "
-                "it invalid",
-                version, kCurrentCacheVersion);
-        } else if (locale != currentLocale) {
-            qaxLog().info(
-                "cached warranty is for locale '%@', system is now in '%@', consider it invalid",
-                locale, currentLocale);
-        } else if (!provider->isSignedInToSkyvault()) {
-            qaxLog().info("user is signed out of Skyvault, cached warranty not allowed");
-        } else {
-            qaxLog().info(
-                "cached warranty is for locale ('%@') and version ('%@') match system, consider "
-                "it valid",
-                locale, version);
-            cacheValid = true;
+        switch (e.cacheState) {
+            case CacheState::OutdatedVersion:
+                qaxLog().info(
+                    "cached warranty is of outdated version '%@', current version is '%@', "
+                    "consider it invalid",
+                    e.cachedVersion, kCurrentCacheVersion);
+                break;
+            case CacheState::OtherLocale:
+                qaxLog().info(
+                    "cached warranty is for locale '%@', system is now in '%@', consider it "
+                    "invalid",
+                    e.cachedLocale, e.currentLocale);
+                break;
+            case CacheState::SignedOut:
+                qaxLog().info("user is signed out of Skyvault, cached warranty not allowed");
+                break;
+            case CacheState::Valid:
+                qaxLog().info(
+                    "cached warranty is for locale ('%@') and version ('%@') match system, "
+                    "consider it valid",
+                    e.cachedLocale, e.cachedVersion);
+                break;
+            case CacheState::None:
+                break;
         }
     }
-
-    bool shouldDownload = false;
-    if (policy == QAXWarrantyPolicyForceDownload) {
-        cacheValid = false;
-        shouldDownload = true;
-    } else if (policy == QAXWarrantyPolicyDefault && !cacheValid) {
+    if (policy == QAXWarrantyPolicyDefault && !e.examinedExpiration) {
         qaxLog().info("Default policy query: cached warranty is invalid, refresh it");
-        shouldDownload = true;
-    } else if (policy == QAXWarrantyPolicyDefault) {
+    } else if (e.examinedExpiration) {
         qaxLog().info("Default policy query: cached warranty is valid, examine expiration date");
-        const auto lastUpdated = provider->lastUpdatedDateForSerialNumber(serialNumber);
-        if (!lastUpdated) {
+        if (!e.remaining) {
             qaxLog().info("warranty validity expired, refresh it");
-            shouldDownload = true;
+        } else if (*e.remaining > 0) {
+            qaxLog().info("warranty valid for %.02f seconds", *e.remaining);
         } else {
-            const double remaining = lastUpdated->timeIntervalSince(platform_->clock->now()) +
-                                     provider->cachedWarrantyValidityDuration();
-            if (remaining > 0) {
-                qaxLog().info("warranty valid for %.02f seconds", remaining);
-            } else {
-                // 0 - remaining rather than -remaining: exactly expired prints 0.00, not -0.00.
-                qaxLog().info("warranty validity expired %.02f seconds ago, refresh it",
-                              0.0 - remaining);
-                shouldDownload = true;
-            }
+            // 0 - remaining rather than -remaining: exactly expired prints 0.00, not -0.00.
+            qaxLog().info("warranty validity expired %.02f seconds ago, refresh it",
+                          0.0 - *e.remaining);
         }
     }
-    qaxLog().info("%s: shouldDownloadWarranty: %d", kOperation, shouldDownload ? 1 : 0);
+    qaxLog().info("%s: shouldDownloadWarranty: %d", kOperation, e.shouldDownload ? 1 : 0);
 
-    auto finish = [serialNumber, cached, cacheValid,
+    auto finish = [serialNumber, fallback = e.answerWithoutDownload(),
                    reply = std::move(reply)](std::shared_ptr<QAXWarranty> downloaded) {
         qaxLog().info("getWarrantyUsingPolicy completionBlock %{private}@ : %d", serialNumber,
                       downloaded ? 1 : 0);
-        if (downloaded) {
-            reply(std::move(downloaded));
-        } else {
-            reply(cacheValid ? cached : nullptr);
-        }
+        reply(downloaded ? std::move(downloaded) : fallback);
     };
-    if (!shouldDownload) {
+    if (!e.shouldDownload) {
         finish(nullptr);
         return;
     }

@@ -24,6 +24,34 @@ namespace qax {
 
 struct Platform;
 
+// What one evaluation of a warranty policy finds, before any download: the cached warranty and
+// whether it may be used (or why not), its freshness when the default policy examines it, and
+// whether the policy downloads. getWarrantyUsingPolicy acts on it; qaxctl explain shows it.
+struct QAXWarrantyPolicyEvaluation {
+    enum class CacheState { None, OutdatedVersion, OtherLocale, SignedOut, Valid };
+
+    QAXWarrantyPolicy policy = QAXWarrantyPolicyDefault;
+    std::shared_ptr<QAXWarranty> cached;
+    CacheState cacheState = CacheState::None;
+    // Read whenever a cached warranty exists.
+    std::optional<std::string> cachedVersion;
+    std::optional<std::string> cachedLocale;
+    std::string currentLocale;
+    // Whether the cached warranty may be the answer; a forced download never uses it.
+    bool cacheValid = false;
+    // The default policy with a valid cache looks at its age: the last-updated date and the
+    // seconds of freshness left (negative once expired; none without a date).
+    bool examinedExpiration = false;
+    std::optional<Date> lastUpdated;
+    std::optional<double> remaining;
+    bool shouldDownload = false;
+
+    // The answer when no download is made or the download gives nothing.
+    std::shared_ptr<QAXWarranty> answerWithoutDownload() const {
+        return cacheValid ? cached : nullptr;
+    }
+};
+
 class QAXAgent : public QAXAgentProtocol,
                  public ExportedObject,
                  public std::enable_shared_from_this<QAXAgent> {
@@ -59,6 +87,12 @@ class QAXAgent : public QAXAgentProtocol,
     // The same for the default device.
     void getWarrantyUsingPolicy(QAXWarrantyPolicy policy,
                                 std::function<void(std::shared_ptr<QAXWarranty>)> reply);
+    // The decisions of getWarrantyUsingPolicy for `serialNumber`, from the provider's cache
+    // facts, the platform's locale and clock. Reads only, logs nothing.
+    static QAXWarrantyPolicyEvaluation evaluateWarrantyPolicy(const Platform& platform,
+                                                              QAXAgentWarrantyProvider& provider,
+                                                              QAXWarrantyPolicy policy,
+                                                              const std::string& serialNumber);
 
     // QAXAgentProtocol.
     void scheduleOutreach(QAXBoolReply reply) override;

@@ -180,6 +180,10 @@ void QAXFollowUp::setFollowUpProvider(std::shared_ptr<QAXFollowUpProvider> provi
     followUpProvider_ = std::move(provider);
 }
 
+std::optional<std::string> QAXFollowUp::serialNumberForItem(const FollowUpItem& item) {
+    return itemSerialNumber(item);
+}
+
 std::string QAXFollowUp::uniqueIdentfierForSerialNumber(
     const std::optional<std::string>& serialNumber) {
     if (!serialNumber) {
@@ -190,7 +194,6 @@ std::string QAXFollowUp::uniqueIdentfierForSerialNumber(
 
 void QAXFollowUp::_setupFollowUpItem(FollowUpItem& item, const QAXDeviceInfo& deviceInfo) {
     std::lock_guard lock(followUpLock());
-    const Platform& platform = *platform_;
     qaxLog().info("%s: %{private}@", kSetupItemOperation, deviceInfo);
     const auto& warranty = deviceInfo.warranty();
     if (!warranty) {
@@ -203,12 +206,7 @@ void QAXFollowUp::_setupFollowUpItem(FollowUpItem& item, const QAXDeviceInfo& de
     const std::optional<Date> eligibleUntil = warranty->hvOfferEligibleUntil();
     item.expirationDate = minus(eligibleUntil, kExpirationLeadSeconds);
 
-    bool showRowBadge = false;
-    if (warranty->hvOfferSettingsRowBadge()) {
-        const auto badgeDate = minus(eligibleUntil, warranty->hvOfferBadgeDurationBeforeEndDate());
-        showRowBadge =
-            isEarlierThanNow(platform, badgeDate) && isLaterThanNow(platform, eligibleUntil);
-    }
+    const bool showRowBadge = _rowBadgeForWarranty(*warranty).on;
     qaxLog().info("%s: shouldShowRowBadge: %d", kSetupItemOperation, showRowBadge);
     // Bits only accumulate: a pending item once badged keeps the badge bit.
     item.displayStyle |= showRowBadge ? kDisplayStyleBadge : kDisplayStyleNoBadge;
@@ -236,18 +234,38 @@ void QAXFollowUp::_setupFollowUpItem(FollowUpItem& item, const QAXDeviceInfo& de
     item.actions = {FollowUpAction{stringOf(warranty->hvLocalizedOfferCTA()), std::nullopt,
                                    kItemOpenActionIdentifier}};
 
-    bool showNotification = false;
-    if (warranty->showNotificationToggle()) {
-        const auto notificationDate =
-            minus(eligibleUntil, warranty->showNotificationBeforeEndDate());
-        qaxLog().info("%s: NotificationDate: %@", kSetupItemOperation, notificationDate);
-        showNotification =
-            isEarlierThanNow(platform, notificationDate) && isLaterThanNow(platform, eligibleUntil);
-        if (showNotification) {
+    const QAXFollowUpCue notification = _notificationForWarranty(*warranty);
+    if (notification.enabled) {
+        qaxLog().info("%s: NotificationDate: %@", kSetupItemOperation, notification.date);
+        if (notification.on) {
             item.notification = _setupFollowUpNotificationWithDeviceInfo(deviceInfo);
         }
     }
-    qaxLog().info("%s: shouldShowNotification: %d", kSetupItemOperation, showNotification);
+    qaxLog().info("%s: shouldShowNotification: %d", kSetupItemOperation, notification.on);
+}
+
+QAXFollowUpCue QAXFollowUp::_rowBadgeForWarranty(const QAXWarranty& warranty) const {
+    QAXFollowUpCue badge;
+    badge.enabled = warranty.hvOfferSettingsRowBadge();
+    if (badge.enabled) {
+        const std::optional<Date> eligibleUntil = warranty.hvOfferEligibleUntil();
+        badge.date = minus(eligibleUntil, warranty.hvOfferBadgeDurationBeforeEndDate());
+        badge.on =
+            isEarlierThanNow(*platform_, badge.date) && isLaterThanNow(*platform_, eligibleUntil);
+    }
+    return badge;
+}
+
+QAXFollowUpCue QAXFollowUp::_notificationForWarranty(const QAXWarranty& warranty) const {
+    QAXFollowUpCue notification;
+    notification.enabled = warranty.showNotificationToggle();
+    if (notification.enabled) {
+        const std::optional<Date> eligibleUntil = warranty.hvOfferEligibleUntil();
+        notification.date = minus(eligibleUntil, warranty.showNotificationBeforeEndDate());
+        notification.on = isEarlierThanNow(*platform_, notification.date) &&
+                          isLaterThanNow(*platform_, eligibleUntil);
+    }
+    return notification;
 }
 
 FollowUpNotification QAXFollowUp::_setupFollowUpNotificationWithDeviceInfo(
@@ -286,11 +304,7 @@ std::optional<Date> QAXFollowUp::postDateForDeviceInfo(const QAXDeviceInfo& devi
     if (!warranty) {
         return std::nullopt;
     }
-    std::optional<Date> postDate = warranty->hvOfferFollowupDisplayDate();
-    if (!postDate) {
-        postDate =
-            minus(warranty->hvOfferEligibleUntil(), warranty->hvOfferDurationBeforeEndDate());
-    }
+    std::optional<Date> postDate = _offerPostDateForWarranty(*warranty);
     // A device activated after its offer opened gets the offer from its activation on.
     const auto& device = deviceInfo.device();
     if (postDate && device && device->activationDate() && *device->activationDate() > *postDate) {
@@ -299,6 +313,49 @@ std::optional<Date> QAXFollowUp::postDateForDeviceInfo(const QAXDeviceInfo& devi
                       kPostRuleOperation);
     }
     return postDate;
+}
+
+std::optional<Date> QAXFollowUp::_offerPostDateForWarranty(const QAXWarranty& warranty) {
+    if (auto displayDate = warranty.hvOfferFollowupDisplayDate()) {
+        return displayDate;
+    }
+    return minus(warranty.hvOfferEligibleUntil(), warranty.hvOfferDurationBeforeEndDate());
+}
+
+QAXFollowUpHistory QAXFollowUp::historyForSerialNumber(const std::string& serialNumber) {
+    std::lock_guard lock(followUpLock());
+    PreferenceStore& preferences = *platform_->preferences;
+    const std::string hash = sha256Hash(serialNumber);
+    QAXFollowUpHistory history;
+    history.posted = arrayHolds(readArray(preferences, kPostedHashesKey), hash);
+    history.dismissed = arrayHolds(readArray(preferences, kDismissedHashesKey), hash);
+    history.dismissedDate = preferences.dateForKey(hash + kDismissedDateSuffix);
+    return history;
+}
+
+QAXFollowUpPostDecision QAXFollowUp::_postDecisionForDeviceInfo(
+    const std::shared_ptr<QAXDeviceInfo>& deviceInfo, bool dismissed, bool repostAllowed,
+    std::optional<Date>* postDate) {
+    std::lock_guard lock(followUpLock());
+    const auto warranty = warrantyOf(deviceInfo);
+    if (!warranty) {
+        return QAXFollowUpPostDecision::NoWarranty;
+    }
+    if (!warranty->hvOfferDisplay()) {
+        return QAXFollowUpPostDecision::NotDisplayed;
+    }
+    if (!isLaterThanNow(*platform_, warranty->hvOfferEligibleUntil())) {
+        return QAXFollowUpPostDecision::NoLongerEligible;
+    }
+    if (!repostAllowed && dismissed && !_checkConversionEligibilityForDevice(deviceInfo)) {
+        return QAXFollowUpPostDecision::Dismissed;
+    }
+    const auto date = postDateForDeviceInfo(*deviceInfo);
+    if (postDate) {
+        *postDate = date;
+    }
+    return isLaterThanNow(*platform_, date) ? QAXFollowUpPostDecision::FuturePostDate
+                                            : QAXFollowUpPostDecision::Due;
 }
 
 bool QAXFollowUp::_postFollowUpWithDevicesInfo(const QAXDeviceInfoList& deviceInfos,
@@ -310,40 +367,41 @@ bool QAXFollowUp::_postFollowUpWithDevicesInfo(const QAXDeviceInfoList& deviceIn
     QAXDeviceInfoList due;
     for (const auto& deviceInfo : deviceInfos) {
         const auto device = deviceOf(deviceInfo);
-        const auto warranty = warrantyOf(deviceInfo);
-        if (!warranty) {
-            qaxLog().info(
-                "%s: No warranty downloaded for device. Don't post a followup for %{private}@",
-                kPostRuleOperation, device);
-            continue;
-        }
-        if (!warranty->hvOfferDisplay()) {
-            qaxLog().info("%s: Device NOT eligible. Don't post a followup for %{private}@",
-                          kPostRuleOperation, device);
-            continue;
-        }
-        if (!isLaterThanNow(platform, warranty->hvOfferEligibleUntil())) {
-            qaxLog().info("%s: Device no longer eligible. Don't post a followup for %{private}@",
-                          kPostRuleOperation, device);
-            continue;
-        }
         const auto serialNumber = serialNumberOf(deviceInfo);
-        if (!repostAllowed && serialNumber && arrayHolds(dismissed, sha256Hash(*serialNumber)) &&
-            !_checkConversionEligibilityForDevice(deviceInfo)) {
-            qaxLog().info("%s: Followup already dismissed for %{private}@, leaving unposted",
-                          kPostRuleOperation, device);
-            continue;
-        }
-        const auto postDate = postDateForDeviceInfo(*deviceInfo);
-        if (!isLaterThanNow(platform, postDate)) {
-            qaxLog().info("%s: Device eligible. Post new  followup for %{private}@",
-                          kPostRuleOperation, device);
-            due.push_back(deviceInfo);
-        } else {
-            qaxLog().info(
-                "%s: Device eligible with future post date. Cannot post followup for "
-                "%{private}@ on: %@",
-                kPostRuleOperation, device, postDate);
+        std::optional<Date> postDate;
+        switch (_postDecisionForDeviceInfo(
+            deviceInfo, serialNumber && arrayHolds(dismissed, sha256Hash(*serialNumber)),
+            repostAllowed, &postDate)) {
+            case QAXFollowUpPostDecision::NoWarranty:
+                qaxLog().info(
+                    "%s: No warranty downloaded for device. Don't post a followup for "
+                    "%{private}@",
+                    kPostRuleOperation, device);
+                break;
+            case QAXFollowUpPostDecision::NotDisplayed:
+                qaxLog().info("%s: Device NOT eligible. Don't post a followup for %{private}@",
+                              kPostRuleOperation, device);
+                break;
+            case QAXFollowUpPostDecision::NoLongerEligible:
+                qaxLog().info(
+                    "%s: Device no longer eligible. Don't post a followup for %{private}@",
+                    kPostRuleOperation, device);
+                break;
+            case QAXFollowUpPostDecision::Dismissed:
+                qaxLog().info("%s: Followup already dismissed for %{private}@, leaving unposted",
+                              kPostRuleOperation, device);
+                break;
+            case QAXFollowUpPostDecision::Due:
+                qaxLog().info("%s: Device eligible. Post new  followup for %{private}@",
+                              kPostRuleOperation, device);
+                due.push_back(deviceInfo);
+                break;
+            case QAXFollowUpPostDecision::FuturePostDate:
+                qaxLog().info(
+                    "%s: Device eligible with future post date. Cannot post followup for "
+                    "%{private}@ on: %@",
+                    kPostRuleOperation, device, postDate);
+                break;
         }
     }
 
@@ -429,7 +487,6 @@ QAXDeviceInfoList QAXFollowUp::refreshFollowupWithDeviceInfos(const QAXDeviceInf
                                                               bool clearUntrackedDeviceFollowups,
                                                               bool allowForcePost) {
     std::lock_guard lock(followUpLock());
-    const Platform& platform = *platform_;
     const auto provider = followUpProvider();
 
     std::optional<std::string> listError;
@@ -464,33 +521,41 @@ QAXDeviceInfoList QAXFollowUp::refreshFollowupWithDeviceInfos(const QAXDeviceInf
         }
         std::erase(untracked, *serialNumber);
         const auto device = deviceInfo->device();
-        const auto& warranty = deviceInfo->warranty();
-        if (!warranty) {
-            qaxLog().info(
-                "%s: No warranty downloaded for device. Remove the followup for %{private}@",
-                kRefreshOperation, device);
-            toClear.push_back(device);
-        } else if (!warranty->hvOfferDisplay()) {
-            qaxLog().info("%s: Device NOT eligible. Remove the followup for %{private}@",
-                          kRefreshOperation, device);
-            toClear.push_back(device);
-        } else if (!isLaterThanNow(platform, warranty->hvOfferEligibleUntil())) {
-            qaxLog().info("%s: Device no longer eligible. Remove the followup for %{private}@",
-                          kRefreshOperation, device);
-            toClear.push_back(device);
-        } else if (isPosted(*serialNumber)) {
-            qaxLog().info("%s: Device eligible. Update the followup for %{private}@",
-                          kRefreshOperation, device);
-            toUpdate.push_back(deviceInfo);
-        } else if (allowForcePost) {
-            qaxLog().info("%s: Device eligible for re-post. Re-post the followup for %{private}@",
-                          kRefreshOperation, device);
-            toRepost.push_back(deviceInfo);
-        } else {
-            qaxLog().info(
-                "%s: Followup already dismissed/not present for %{private}@, leaving "
-                "unposted",
-                kRefreshOperation, device);
+        switch (
+            _refreshDecisionForDeviceInfo(*deviceInfo, isPosted(*serialNumber), allowForcePost)) {
+            case QAXFollowUpRefreshDecision::NoWarranty:
+                qaxLog().info(
+                    "%s: No warranty downloaded for device. Remove the followup for %{private}@",
+                    kRefreshOperation, device);
+                toClear.push_back(device);
+                break;
+            case QAXFollowUpRefreshDecision::NotDisplayed:
+                qaxLog().info("%s: Device NOT eligible. Remove the followup for %{private}@",
+                              kRefreshOperation, device);
+                toClear.push_back(device);
+                break;
+            case QAXFollowUpRefreshDecision::NoLongerEligible:
+                qaxLog().info("%s: Device no longer eligible. Remove the followup for %{private}@",
+                              kRefreshOperation, device);
+                toClear.push_back(device);
+                break;
+            case QAXFollowUpRefreshDecision::Update:
+                qaxLog().info("%s: Device eligible. Update the followup for %{private}@",
+                              kRefreshOperation, device);
+                toUpdate.push_back(deviceInfo);
+                break;
+            case QAXFollowUpRefreshDecision::Repost:
+                qaxLog().info(
+                    "%s: Device eligible for re-post. Re-post the followup for %{private}@",
+                    kRefreshOperation, device);
+                toRepost.push_back(deviceInfo);
+                break;
+            case QAXFollowUpRefreshDecision::LeaveUnposted:
+                qaxLog().info(
+                    "%s: Followup already dismissed/not present for %{private}@, leaving "
+                    "unposted",
+                    kRefreshOperation, device);
+                break;
         }
     }
 
@@ -527,6 +592,25 @@ QAXDeviceInfoList QAXFollowUp::refreshFollowupWithDeviceInfos(const QAXDeviceInf
         }
     }
     return result;
+}
+
+QAXFollowUpRefreshDecision QAXFollowUp::_refreshDecisionForDeviceInfo(
+    const QAXDeviceInfo& deviceInfo, bool posted, bool allowForcePost) const {
+    const auto& warranty = deviceInfo.warranty();
+    if (!warranty) {
+        return QAXFollowUpRefreshDecision::NoWarranty;
+    }
+    if (!warranty->hvOfferDisplay()) {
+        return QAXFollowUpRefreshDecision::NotDisplayed;
+    }
+    if (!isLaterThanNow(*platform_, warranty->hvOfferEligibleUntil())) {
+        return QAXFollowUpRefreshDecision::NoLongerEligible;
+    }
+    if (posted) {
+        return QAXFollowUpRefreshDecision::Update;
+    }
+    return allowForcePost ? QAXFollowUpRefreshDecision::Repost
+                          : QAXFollowUpRefreshDecision::LeaveUnposted;
 }
 
 QAXDeviceInfoList QAXFollowUp::refreshFollowupWithDeviceInfos(

@@ -148,6 +148,73 @@ TEST_F(QAXAgentTest, PolicyDecisionTable) {
     }
 }
 
+// What the evaluation tells beyond the reply: why a cache is not valid, how much freshness
+// is left, and what is answered when no download happens.
+TEST_F(QAXAgentTest, PolicyEvaluationFacts) {
+    using S = QAXWarrantyPolicyEvaluation::CacheState;
+    const Date now = env.clock->now();
+    struct Row {
+        const char* name;
+        Cache cache;
+        bool signedIn;
+        std::uint64_t policy;
+        S state;
+        std::optional<double> remaining;
+        bool answersCached;
+    } rows[] = {
+        {"fresh", {warranty("c"), "2", "en_US", now.byAdding(-86390)}, true, 0, S::Valid, 10, true},
+        {"expired",
+         {warranty("c"), "2", "en_US", now.byAdding(-86410)},
+         true,
+         0,
+         S::Valid,
+         -10,
+         true},
+        {"no date",
+         {warranty("c"), "2", "en_US", std::nullopt},
+         true,
+         0,
+         S::Valid,
+         std::nullopt,
+         true},
+        {"forced", {warranty("c"), "2", "en_US", now}, true, 2, S::Valid, std::nullopt, false},
+        {"cached only", {warranty("c"), "2", "en_US", now}, true, 1, S::Valid, std::nullopt, true},
+        {"old version",
+         {warranty("c"), "1", "en_US", now},
+         true,
+         0,
+         S::OutdatedVersion,
+         std::nullopt,
+         false},
+        {"other locale",
+         {warranty("c"), "2", "fr_FR", now},
+         true,
+         1,
+         S::OtherLocale,
+         std::nullopt,
+         false},
+        {"signed out",
+         {warranty("c"), "2", "en_US", now},
+         false,
+         1,
+         S::SignedOut,
+         std::nullopt,
+         false},
+        {"none", {}, true, 1, S::None, std::nullopt, false},
+    };
+    for (const auto& row : rows) {
+        SCOPED_TRACE(row.name);
+        provider->setCache("S", row.cache);
+        provider->signedIn = row.signedIn;
+        const auto e = QAXAgent::evaluateWarrantyPolicy(
+            *env.platform, *provider, static_cast<QAXWarrantyPolicy>(row.policy), "S");
+        EXPECT_EQ(e.cacheState, row.state);
+        EXPECT_EQ(e.remaining, row.remaining);
+        EXPECT_EQ(e.answerWithoutDownload() != nullptr, row.answersCached);
+    }
+    EXPECT_TRUE(provider->calls().empty()) << "an evaluation acts on nothing";
+}
+
 TEST_F(QAXAgentTest, AllDevicesJoinWaitsForOverlappingCallsOnOneAgent) {
     provider->setDownloadResult("W1", warranty("w1"));
     provider->holdDownloads(true);

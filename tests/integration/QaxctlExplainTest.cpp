@@ -1,0 +1,370 @@
+// qaxctl explain against a home prepared with the agent's own code (cached warranty, posted
+// item, preferences, an activity registration), on the simulated clock: what it says about the
+// badge, the notification, the end of the offer and the next refresh is what the real agent
+// then does, and no run of it changes a single file.
+#include <gtest/gtest.h>
+#include <sys/stat.h>
+
+#include <chrono>
+#include <cmath>
+#include <filesystem>
+#include <map>
+#include <thread>
+
+#include "AgentProcess.h"
+#include "core/Hash.h"
+#include "core/JsonCodec.h"
+#include "devices/QAXDeviceInfo.h"
+#include "followup/QAXFollowUp.h"
+#include "platform/PreferenceStore.h"
+#include "platform/QAXSettings.h"
+#include "platform/host/HostActivityRegistry.h"
+#include "platform/host/HostActivityTriggerRecord.h"
+#include "platform/host/HostPlatform.h"
+#include "platform/host/SimulatedClock.h"
+#include "platform/host/SystemClock.h"
+#include "scheduling/QAXScheduler.h"
+#include "warranty/QAXWarranty.h"
+
+namespace qax {
+namespace {
+
+namespace fs = std::filesystem;
+
+constexpr double kDay = 86400;
+constexpr const char* kPhone = "EXPLAINPHONE1";
+constexpr const char* kRefresh = "com.velmora.qaxagent.followuprefresh";
+
+// Every file below `root`: content digest, inode and modification time, so that a rewrite
+// with the same bytes counts as a change too.
+std::map<std::string, std::string> fingerprint(const fs::path& root) {
+    std::map<std::string, std::string> files;
+    for (const auto& entry : fs::recursive_directory_iterator(root)) {
+        struct stat st {};
+        ::lstat(entry.path().c_str(), &st);
+        std::string print = std::to_string(st.st_ino) + " " + std::to_string(st.st_mtim.tv_sec) +
+                            "." + std::to_string(st.st_mtim.tv_nsec);
+        if (entry.is_regular_file()) {
+            print += " " + sha256Hash(test::readFile(entry.path()));
+        }
+        files[fs::relative(entry.path(), root).string()] = print;
+    }
+    return files;
+}
+
+std::optional<Date> dateAt(const Value& v, const std::string& path) {
+    const Value* at = &v;
+    std::size_t from = 0;
+    while (at && from <= path.size()) {
+        const auto dot = path.find('.', from);
+        at = at->find(path.substr(from, dot - from));
+        from = dot == std::string::npos ? path.size() + 1 : dot + 1;
+    }
+    return at && at->isString() ? Date::parseIso8601(*at->asString()) : std::nullopt;
+}
+
+const Value& at(const Value& v, const std::string& section, const std::string& key) {
+    static const Value none;
+    const Value* s = v.find(section);
+    const Value* k = s ? s->find(key) : nullptr;
+    return k ? *k : none;
+}
+
+class QaxctlExplainTest : public ::testing::Test {
+  protected:
+    void SetUp() override {
+        agent.extraEnvironment = {
+            "QAX_CLOCK=simulated", "QAX_NETWORK=down", "QAX_BOOT_ID=explain-boot",
+            "QAX_SHARE_DIR=" + std::string(QAX_SOURCE_DIR) + "/share/qaxagent"};
+        agent.writeRootFile("device.plist",
+                            Value(Value::Dictionary{{"SerialNumber", Value(kPhone)},
+                                                    {"ProductType", Value("Phone14,2")},
+                                                    {"ProductVersion", Value("17.2")}}));
+        agent.writeRootFile("accounts.plist",
+                            Value(Value::Dictionary{{"PrimaryCloudAccount",
+                                                     Value(Value::Dictionary{{"altDSID", "a"}})}}));
+        agent.writeRootFile("locale.plist",
+                            Value(Value::Dictionary{{"PreferredLocale", Value("en_US")}}));
+        // This boot and this system version are behind the agent already: its start-up runs
+        // no upgrade or boot work, only what is registered.
+        ASSERT_TRUE(HostActivityTriggerRecord::save(
+            agent.platformRoot(),
+            {{"com.velmora.qaxagent.upgrade", TriggerRecord{std::nullopt, {"17.2"}}},
+             {"com.velmora.qaxagent.boot", TriggerRecord{"explain-boot", {}}}},
+            nullptr));
+        platform = makeHostPlatform(
+            HostEnvironment{agent.home(), agent.platformRoot(), agent.runtimeDirectory(),
+                            std::string(QAX_SOURCE_DIR) + "/share/qaxagent", true},
+            nullptr);
+        qax_registerDefaults(*platform->preferences);
+        start = std::floor(platform->clock->now().secondsSince1970());
+        // As the first upgrade run leaves it, long before the offer.
+        platform->preferences->setObject("DefaultDeviceActivationDate",
+                                         Value(Date(start - 60 * kDay)));
+        previousSink = qaxLog().sink();
+        qaxLog().setSink(std::make_shared<CapturingLogSink>());
+    }
+    void TearDown() override { qaxLog().setSink(previousSink); }
+
+    // A coverage summary whose offer opened `openedDaysAgo` days ago and ends `endsInDays`
+    // days from the start; the badge 7 days and the notification 3 days before the end.
+    Value summary(double openedDaysAgo, double endsInDays) const {
+        auto ms = [&](double days) {
+            return Value(static_cast<std::int64_t>((start + days * kDay) * 1000));
+        };
+        return Value(Value::Dictionary{
+            {"covered", true},
+            {"hvOfferEligible", true},
+            {"hvOfferEligibleUntil", ms(endsInDays)},
+            {"hvOfferFollowupDisplayDate", ms(-openedDaysAgo)},
+            {"hvLocalizedOfferLabel", "Add the Haverly plan"},
+            {"hvLocalizedOfferPluralDescFormat", "%@ days left to add coverage"},
+            {"hvLocalizedOfferSingularDesc", "Last day to add coverage"},
+            {"hvNotificationLocalizedOfferLabel", "Coverage is ending soon"},
+            {"hvNotificationLocalizedOfferPluralDescFormat", "%@ days left to add the plan"},
+            {"hvNotificationLocalizedOfferSingularDesc", "Last day to add the plan"},
+            {"hvLocalizedOfferCTA", "Add Coverage"},
+            {"featureToggleParameters",
+             Value(Value::Dictionary{{"hvOfferDisplay", true},
+                                     {"hvOfferSettingsRowBadge", true},
+                                     {"hvOfferDurationDaysBeforeEndDate", 30}})},
+            {"hvOfferBadgeBeforeEndDate", 7},
+            {"showNotificationToggle", true},
+            {"showNotificationBeforeEndDate", 3}});
+    }
+
+    // The cache file and its keys, as a download leaves them.
+    void cacheSummary(const Value& s) {
+        ASSERT_TRUE(
+            QAXWarranty::warrantyWithDictionary(platform, s, kPhone)->cacheWarranty(kPhone));
+        const std::string hash = sha256Hash(kPhone);
+        auto& prefs = *platform->preferences;
+        prefs.setObject(hash + "_CachedWarrantyLastUpdatedDate", Value(Date(start - 3600)));
+        prefs.setObject(hash + "_CachedWarrantyLocale", Value("en_US"));
+        prefs.setObject(hash + "_CachedWarrantyVersion", Value("2"));
+    }
+    std::shared_ptr<QAXDeviceInfo> phoneInfo() {
+        return QAXDeviceInfo::deviceInfoWithDevice(
+            QAXDevice::deviceWithName(
+                "Default Device", kPhone,
+                platform->preferences->dateForKey("DefaultDeviceActivationDate"),
+                QAXDeviceTypeDefault),
+            QAXWarranty::cachedWarrantyForSerialNumber(platform, kPhone));
+    }
+    // A refresh registration due now, as a post run would have left it.
+    void registerRefreshNow() {
+        const Date now = Date(platform->clock->now().secondsSince1970());
+        HostActivityRegistry::Records records = HostActivityRegistry::load(agent.platformRoot());
+        ActivityRecord& r = records[kRefresh];
+        r.scheduledAt = now;
+        r.dueDate = now;
+        ASSERT_TRUE(HostActivityRegistry::save(agent.platformRoot(), records, nullptr));
+        platform->preferences->setObject(QAXScheduler::targetDateKey(kRefresh), Value(now));
+    }
+
+    test::ToolResult ctl(const std::vector<std::string>& args) {
+        return test::runTool(QAX_CTL_BINARY, args, agent.environment());
+    }
+    void advanceTo(Date date) {
+        const double by = std::ceil(date.timeIntervalSince(platform->clock->now()));
+        ASSERT_EQ(ctl({"clock", "advance", std::to_string(static_cast<long long>(by))}).status, 0);
+        std::static_pointer_cast<SimulatedClock>(platform->clock)->reloadOffset();
+    }
+    // Runs explain and checks that it changed no file of the home and platform root.
+    Value explain(const std::vector<std::string>& extra = {}, std::string* textOut = nullptr) {
+        const auto before = fingerprint(agent.home());
+        std::vector<std::string> args{"explain", "--json"};
+        args.insert(args.end(), extra.begin(), extra.end());
+        auto r = ctl(args);
+        EXPECT_EQ(r.status, 0) << r.err;
+        EXPECT_EQ(fingerprint(agent.home()), before) << "explain changed a file";
+        args.erase(args.begin() + 1);
+        auto text = ctl(args);
+        EXPECT_EQ(text.status, 0) << text.err;
+        EXPECT_EQ(fingerprint(agent.home()), before) << "explain changed a file";
+        if (textOut) {
+            *textOut = text.out;
+        }
+        auto v = parseJson(r.out);
+        EXPECT_TRUE(v && v->isDictionary()) << r.out;
+        return v.value_or(Value());
+    }
+    // Starts the agent, lets it run the due refresh, and stops it.
+    void runAgentRefresh() {
+        ASSERT_TRUE(agent.start()) << agent.log();
+        const std::string prefix = "Activity '" + std::string(kRefresh) + "' ";
+        const auto deadline = std::chrono::steady_clock::now() + std::chrono::seconds(20);
+        while (agent.countInLog(prefix + "finished") + agent.countInLog(prefix + "reported") == 0 &&
+               std::chrono::steady_clock::now() < deadline) {
+            std::this_thread::sleep_for(std::chrono::milliseconds(10));
+        }
+        EXPECT_LT(std::chrono::steady_clock::now(), deadline) << agent.log();
+        agent.stop();
+    }
+    // The platform's pending registration of the refresh: what the agent's run scheduled.
+    std::optional<Date> refreshDue() {
+        auto records = HostActivityRegistry::load(agent.platformRoot());
+        auto r = records.find(kRefresh);
+        return r == records.end() ? std::nullopt : r->second.dueDate;
+    }
+    Value followUp() {
+        auto list = parseJson(ctl({"followups", "--json"}).out);
+        return list && list->isArray() && list->asArray()->size() == 1 ? list->asArray()->front()
+                                                                       : Value();
+    }
+
+    test::AgentProcess agent;
+    std::shared_ptr<Platform> platform;
+    double start = 0;
+    std::shared_ptr<LogSink> previousSink;
+};
+
+TEST_F(QaxctlExplainTest, PredictsWhatTheAgentsRefreshDoes) {
+    cacheSummary(summary(5, 10.5));
+    ASSERT_TRUE(QAXFollowUp(platform).postFollowUpWithDevicesInfo({phoneInfo()}));
+
+    Value x = explain();
+    EXPECT_EQ(at(x, "cache", "state"), Value("valid"));
+    EXPECT_EQ(at(x, "cache", "fresh"), Value(true));
+    const Value* policies = x.find("policies");
+    ASSERT_TRUE(policies && policies->isArray() && policies->asArray()->size() == 3);
+    const char* answers[] = {"cached", "cached", "download"};
+    for (int p = 0; p < 3; ++p) {
+        EXPECT_EQ(*(*policies->asArray())[p].find("answer"), Value(answers[p])) << p;
+    }
+    EXPECT_EQ(at(x, "offer", "posted"), Value(true));
+    EXPECT_EQ(at(x, "offer", "postRule"), Value("due"));
+    EXPECT_EQ(at(x, "refresh", "rule"), Value("update"));
+    EXPECT_EQ(at(x, "item", "badge"), Value(false));
+    const auto badgeOn = dateAt(x, "offer.badge.date");
+    const auto notificationOn = dateAt(x, "offer.notification.date");
+    const auto end = dateAt(x, "offer.eligibleUntil");
+    ASSERT_TRUE(badgeOn && notificationOn && end);
+    EXPECT_EQ(end->timeIntervalSince(*badgeOn), 7 * kDay);
+    EXPECT_EQ(end->timeIntervalSince(*notificationOn), 3 * kDay);
+
+    // Past the badge date: explain says a refresh turns the badge on, and the agent's refresh
+    // does, then schedules the next refresh when explain said it would.
+    struct Step {
+        Date to;
+        bool badge, notification;
+    } steps[] = {{badgeOn->byAdding(60), true, false}, {notificationOn->byAdding(60), true, true}};
+    for (const auto& step : steps) {
+        SCOPED_TRACE(step.to.description());
+        advanceTo(step.to);
+        x = explain();
+        EXPECT_EQ(at(x, "offer", "badge").find("on")->truthy(), step.badge);
+        EXPECT_EQ(at(x, "offer", "notification").find("on")->truthy(), step.notification);
+        EXPECT_EQ(at(x, "refresh", "updatesThisDevice"), Value(true));
+        EXPECT_EQ(*at(x, "refresh", "item").find("badge"), Value(step.badge));
+        const auto next = dateAt(x, "refresh.nextRefreshDate");
+        ASSERT_TRUE(next);
+        registerRefreshNow();
+        runAgentRefresh();
+        const Value item = followUp();
+        ASSERT_TRUE(item.isDictionary()) << agent.log();
+        EXPECT_EQ(*item.find("badge"), Value(step.badge)) << item.description();
+        EXPECT_EQ(item.find("notification") != nullptr, step.notification) << item.description();
+        EXPECT_EQ(*item.find("dayText"), *at(x, "refresh", "item").find("dayText"));
+        // The platform keeps whole seconds of the delay.
+        const auto due = refreshDue();
+        ASSERT_TRUE(due) << agent.log();
+        EXPECT_NEAR(due->timeIntervalSince(*next), 0, 1.5);
+    }
+
+    // Past the end: explain says the refresh removes the item and ends the chain; it does.
+    advanceTo(end->byAdding(60));
+    x = explain();
+    EXPECT_EQ(at(x, "offer", "eligible"), Value(false));
+    EXPECT_EQ(at(x, "refresh", "rule"), Value("noLongerEligible"));
+    EXPECT_EQ(at(x, "refresh", "clearsThisDevice"), Value(true));
+    EXPECT_EQ(at(x, "refresh", "continues"), Value(false));
+    registerRefreshNow();
+    runAgentRefresh();
+    EXPECT_EQ(followUp(), Value());
+    EXPECT_FALSE(refreshDue()) << agent.log();
+}
+
+TEST_F(QaxctlExplainTest, DismissalConversionAndActivationAgreeWithThePostRule) {
+    struct Row {
+        const char* name;
+        double dismissedDaysAgo;  // < 0: not dismissed
+        double activatedInDays;
+        const char* postRule;
+        bool reopens, moved;
+    } rows[] = {
+        {"dismissed before the offer opened", 8, -60, "due", true, false},
+        {"dismissed after it opened", 2, -60, "dismissed", false, false},
+        {"activated after it opened", -1, 2, "futurePostDate", false, true},
+    };
+    cacheSummary(summary(5, 20));
+    for (const auto& row : rows) {
+        SCOPED_TRACE(row.name);
+        auto& prefs = *platform->preferences;
+        const std::string hash = sha256Hash(kPhone);
+        for (const char* key :
+             {"FollowupDismissedSerialNumberHashes", "FollowupPostedSerialNumberHashes",
+              "DefaultDeviceActivationDate"}) {
+            prefs.removeObject(key);
+        }
+        prefs.removeObject(hash + ".dismissed");
+        if (row.dismissedDaysAgo >= 0) {
+            prefs.setObject("FollowupDismissedSerialNumberHashes",
+                            Value(Value::Array{Value(hash)}));
+            prefs.setObject(hash + ".dismissed", Value(Date(start - row.dismissedDaysAgo * kDay)));
+        }
+        prefs.setObject("DefaultDeviceActivationDate",
+                        Value(Date(start + row.activatedInDays * kDay)));
+        const Value x = explain({kPhone});
+        EXPECT_EQ(at(x, "offer", "postRule"), Value(row.postRule));
+        EXPECT_EQ(at(x, "offer", "conversionReopens"), Value(row.reopens));
+        EXPECT_EQ(at(x, "offer", "postDateMovedByActivation"), Value(row.moved));
+        EXPECT_EQ(at(x, "post", "postsThisDevice"), Value(std::string(row.postRule) == "due"));
+        // The agent's post rule, for real on these files, does what explain said.
+        EXPECT_EQ(QAXFollowUp(platform).postFollowUpWithDevicesInfo({phoneInfo()}),
+                  std::string(row.postRule) == "due");
+    }
+}
+
+TEST_F(QaxctlExplainTest, BadInputGetsAClearAnswer) {
+    cacheSummary(summary(5, 20));
+    const fs::path root = agent.platformRoot();
+    const fs::path cacheFile = fs::path(agent.home()) /
+                               "Library/Application Support/com.velmora.Kestova" /
+                               (sha256Hash(kPhone) + "_Warranty.plist");
+    struct Row {
+        const char* name;
+        std::vector<std::string> args;
+        fs::path corrupt;  // written with garbage first
+        const char* text;  // in the text output
+    } rows[] = {
+        {"unknown serial", {"NOSUCHSERIAL"}, {}, "tracks no device with the serial number"},
+        {"no cache", {"NOSUCHSERIAL"}, {}, "No cached warranty"},
+        {"corrupt follow-up store",
+         {},
+         root / "state/followups/com.velmora.Kestova.plist",
+         "Ignoring platform file"},
+        {"corrupt activity registry", {}, root / "state/activities.plist", "Problems"},
+        {"corrupt cache", {}, cacheFile, "holds no coverage summary"},
+        {"corrupt preferences",
+         {},
+         fs::path(agent.home()) / "Library/Preferences/com.velmora.qaxagent.plist",
+         "Preference domain file"},
+    };
+    for (const auto& row : rows) {
+        SCOPED_TRACE(row.name);
+        if (!row.corrupt.empty()) {
+            test::writeFile(row.corrupt, "<plist><dict><key>x</key>");
+        }
+        std::string text;
+        explain(row.args, &text);
+        EXPECT_NE(text.find(row.text), std::string::npos) << text;
+    }
+    for (const auto& bad :
+         std::vector<std::vector<std::string>>{{"explain", "A", "B"}, {"explain", "--verbose"}}) {
+        EXPECT_EQ(ctl(bad).status, 64) << bad.back();
+    }
+}
+
+}  // namespace
+}  // namespace qax
