@@ -414,21 +414,27 @@ void HostBackgroundActivityScheduler::complete(const std::string& identifier, st
         slot.running = false;
         transaction = std::move(slot.transaction);
         slot.record.lastResult = static_cast<std::int64_t>(result);
+        // The registry is saved before the outcome is logged, so that whoever reads the log
+        // (qaxctl, a test) finds the file already saying so.
         if (!sameRegistration) {
+            saveLocked();
             qaxLog().info("Activity '%@' reported %ld; it was scheduled again during the run",
                           identifier, static_cast<std::int64_t>(result));
         } else if (result == ActivityResult::Finished) {
             clearRegistration(slot.record);
             slot.retryAt.reset();
+            saveLocked();
             qaxLog().info("Activity '%@' finished", identifier);
         } else if (slot.record.pending()) {
             slot.record.deferrals++;
             const double wait = retryDelay(slot.record.deferrals);
             slot.retryAt = platform->clock->now().byAdding(wait);
+            saveLocked();
             qaxLog().info("Activity '%@' deferred (%ld times); retrying in %.02f s", identifier,
                           slot.record.deferrals, wait);
+        } else {
+            saveLocked();
         }
-        saveLocked();
     }
     postEvaluate();
 }
