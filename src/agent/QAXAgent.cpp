@@ -33,17 +33,6 @@ constexpr const char* kPairedBluetoothDevicesSerialNumbersKey =
 constexpr const char* kUnknownDeviceName = "<unknown>";
 
 // The printed form of a list of device infos in logs.
-std::string describeDeviceInfos(const std::vector<std::shared_ptr<QAXDeviceInfo>>& infos) {
-    if (infos.empty()) {
-        return "(\n)";
-    }
-    std::string text = "(\n";
-    for (std::size_t i = 0; i < infos.size(); ++i) {
-        text += "    " + (infos[i] ? infos[i]->description() : std::string("(null)"));
-        text += i + 1 < infos.size() ? ",\n" : "\n";
-    }
-    return text + ")";
-}
 
 // The value a substitution dictionary holds for `serialNumber`, when it holds a string.
 std::optional<std::string> substitute(const std::optional<Value::Dictionary>& dictionary,
@@ -184,7 +173,7 @@ void QAXAgent::getWarrantyUsingPolicy(QAXWarrantyPolicy policy, const std::strin
     using CacheState = QAXWarrantyPolicyEvaluation::CacheState;
     static constexpr const char* kOperation =
         "-[QAXAgent getWarrantyUsingPolicy:serialNumber:withReply:]";
-    qaxLog().info("getting warranty using policy %@: %lu", serialNumber,
+    qaxLog().info("getting warranty using policy %@: %lu", privateText(serialNumber),
                   static_cast<std::uint64_t>(policy));
 
     auto provider = warrantyProvider();
@@ -195,9 +184,9 @@ void QAXAgent::getWarrantyUsingPolicy(QAXWarrantyPolicy policy, const std::strin
     const QAXWarrantyPolicyEvaluation e =
         evaluateWarrantyPolicy(*platform_, *provider, policy, serialNumber);
     if (!e.cached) {
-        qaxLog().info("no cached warranty : %@", serialNumber);
+        qaxLog().info("no cached warranty : %@", privateText(serialNumber));
     } else {
-        qaxLog().info("Has cached warranty : %@", serialNumber);
+        qaxLog().info("Has cached warranty : %@", privateText(serialNumber));
         switch (e.cacheState) {
             case CacheState::OutdatedVersion:
                 qaxLog().info(
@@ -364,11 +353,11 @@ void QAXAgent::getDeviceInfoForSerialNumber(const std::string& requestedSerialNu
         if (!replacement) {
             replacement = substitute(accessories, serialNumber);
         }
-        qaxLog().debug("serialNumberOverride for Serial Number: %@ with serial: %@", serialNumber,
-                       replacement);
+        qaxLog().debug("serialNumberOverride for Serial Number: %@ with serial: %@",
+                       privateText(serialNumber), privateText(replacement));
         if (replacement) {
-            qaxLog().debug("Override Serial Number: %@ found for SN: %@", *replacement,
-                           serialNumber);
+            qaxLog().debug("Override Serial Number: %@ found for SN: %@", privateText(*replacement),
+                           privateText(serialNumber));
             serialNumber = *replacement;
         }
     }
@@ -425,7 +414,7 @@ void QAXAgent::getAllDeviceInfosUsingPolicy(QAXWarrantyPolicy policy, bool updat
             std::lock_guard lock(results->mutex);
             infos = results->infos;
         }
-        qaxLog().info("getAllDeviceInfosUsingPolicy: '%@'", describeDeviceInfos(infos));
+        qaxLog().info("getAllDeviceInfosUsingPolicy: '%@'", logDescriptionOfList(infos));
         if (updateFollowUps) {
             if (auto provider = self->warrantyProvider()) {
                 provider->refreshFollowupWithDeviceInfos(infos);

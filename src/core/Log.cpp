@@ -77,6 +77,47 @@ std::string argDouble(const LogArg& arg, int precision) {
 
 }  // namespace
 
+namespace {
+
+// Bytes that never occur in the texts the agent logs (record and unit separators).
+constexpr char kPrivateBegin = '\x1e';
+constexpr char kPrivateEnd = '\x1f';
+constexpr std::string_view kRedacted = "<private>";
+
+}  // namespace
+
+std::string privateText(std::string_view text) {
+    std::string out;
+    out.reserve(text.size() + 2);
+    out += kPrivateBegin;
+    out += text;
+    out += kPrivateEnd;
+    return out;
+}
+
+std::string resolvePrivateText(std::string message, bool showPrivate) {
+    std::size_t begin = message.find(kPrivateBegin);
+    if (begin == std::string::npos) {
+        return message;
+    }
+    std::string out(message, 0, begin);
+    int depth = 0;
+    for (std::size_t i = begin; i < message.size(); ++i) {
+        const char c = message[i];
+        if (c == kPrivateBegin) {
+            // A nested mark (a private description inside a private one) is one span.
+            if (depth++ == 0 && !showPrivate) {
+                out += kRedacted;
+            }
+        } else if (c == kPrivateEnd) {
+            depth = depth > 0 ? depth - 1 : 0;
+        } else if (depth == 0 || showPrivate) {
+            out += c;
+        }
+    }
+    return out;
+}
+
 std::string formatLogMessage(std::string_view format, const std::vector<LogArg>& args,
                              bool showPrivate) {
     std::string out;

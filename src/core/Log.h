@@ -45,6 +45,13 @@ concept HasDescription = requires(const T& t) {
     { t.description() } -> std::convertible_to<std::string>;
 };
 
+// What a log shows of an object that holds private values (marked with privateText()); its
+// plain description() stays for people and tests.
+template <typename T>
+concept HasLogDescription = requires(const T& t) {
+    { t.logDescription() } -> std::convertible_to<std::string>;
+};
+
 template <typename T>
 LogArg toLogArg(const T& value) {
     using D = std::decay_t<T>;
@@ -68,6 +75,8 @@ LogArg toLogArg(const T& value) {
         return value ? LogArg{std::string(value)} : LogArg{};
     } else if constexpr (std::is_convertible_v<D, std::string_view>) {
         return LogArg{std::string(std::string_view(value))};
+    } else if constexpr (HasLogDescription<D>) {
+        return LogArg{std::string(value.logDescription())};
     } else if constexpr (HasDescription<D>) {
         return LogArg{std::string(value.description())};
     } else if constexpr (requires {
@@ -83,6 +92,32 @@ LogArg toLogArg(const T& value) {
     } else {
         static_assert(sizeof(D) == 0, "type cannot be logged");
     }
+}
+
+// Marks `text` as private wherever it ends up in a message, even inside an object's
+// description that is logged with "%@": the log prints "<private>" in its place unless private
+// logging is on. Serial numbers are logged only this way or through "%{private}@".
+std::string privateText(std::string_view text);
+template <typename T>
+requires std::same_as<T, std::optional<std::string>> std::optional<std::string> privateText(
+    const T& text) {
+    return text ? std::optional<std::string>(privateText(std::string_view(*text))) : std::nullopt;
+}
+// A formatted message as a sink should show it: marked spans become "<private>", or lose their
+// marks when private logging is on.
+std::string resolvePrivateText(std::string message, bool showPrivate);
+
+// Objects in the bracketed list form of logs, one per line: "(\n    a,\n    b\n)".
+template <typename Range>
+std::string logDescriptionOfList(const Range& objects) {
+    std::string text = "(\n";
+    std::size_t left = std::size(objects);
+    for (const auto& object : objects) {
+        text += "    ";
+        text += object ? object->logDescription() : std::string("(null)");
+        text += --left > 0 ? ",\n" : "\n";
+    }
+    return text + ")";
 }
 
 // Expands %@, %{private}@, %{public}@, %{public}s, %s, %d, %ld, %lu, %u, %.02f, %f and %%.
@@ -113,7 +148,9 @@ class Log {
             return;
         }
         std::vector<LogArg> list{toLogArg(args)...};
-        s->write(level, subsystem_, category_, formatLogMessage(format, list, s->showsPrivate()));
+        const bool showPrivate = s->showsPrivate();
+        s->write(level, subsystem_, category_,
+                 resolvePrivateText(formatLogMessage(format, list, showPrivate), showPrivate));
     }
 
     std::shared_ptr<LogSink> sink() const;

@@ -53,10 +53,13 @@ std::string QAXDevice::deviceTypeString() const {
     }
 }
 
-std::string QAXDevice::description() const {
+std::string QAXDevice::describe(bool markPrivate) const {
+    auto mark = [markPrivate](const std::optional<std::string>& text) {
+        return markPrivate ? privateText(text) : text;
+    };
     return formatLogMessage("%@ (%@) (%@) - %@",
-                            {toLogArg(name_), toLogArg(serialNumber_), toLogArg(activationDate_),
-                             toLogArg(deviceTypeString())},
+                            {toLogArg(mark(name_)), toLogArg(mark(serialNumber_)),
+                             toLogArg(activationDate_), toLogArg(deviceTypeString())},
                             true);
 }
 
@@ -108,7 +111,7 @@ std::string QAXDevice::describeDevices(
     const std::map<std::string, std::shared_ptr<QAXDevice>>& devices) {
     Value::Dictionary described;
     for (const auto& [serial, device] : devices) {
-        described[serial] = device ? Value(device->description()) : Value("(null)");
+        described[privateText(serial)] = device ? Value(device->logDescription()) : Value("(null)");
     }
     return Value(std::move(described)).description();
 }

@@ -40,8 +40,10 @@ class QAXDevice {
 
     // "Default", "Watch" or "Other".
     std::string deviceTypeString() const;
-    // "<name> (<serial number>) (<activation date>) - <type>".
-    std::string description() const;
+    // "<name> (<serial number>) (<activation date>) - <type>"; the log's form has the name
+    // and serial number private.
+    std::string description() const { return describe(false); }
+    std::string logDescription() const { return describe(true); }
 
     // {"$class": "QAXDevice", "name", "serialNumber", "activationDate", "deviceType"}; keys
     // whose value is none are left out.
@@ -56,6 +58,9 @@ class QAXDevice {
         const std::map<std::string, std::shared_ptr<QAXDevice>>& devices);
 
   private:
+    // Names are the user's (or, on internal builds, carry a serial number): private in logs.
+    std::string describe(bool markPrivate) const;
+
     const std::optional<std::string> name_;
     const std::optional<std::string> serialNumber_;
     const std::optional<Date> activationDate_;

@@ -33,13 +33,17 @@ bool QAXDeviceInfo::isEqual(const QAXDeviceInfo* other) const {
     return other->warranty_ && other->warranty_->isEqual(warranty_.get());
 }
 
-std::string QAXDeviceInfo::description() const {
+std::string QAXDeviceInfo::describe(bool forLog) const {
     std::string offer = "No offer";
     if (warranty_ && warranty_->hvOfferDisplay()) {
         offer = formatLogMessage("Eligible until %@", {toLogArg(warranty_->hvOfferEligibleUntil())},
                                  true);
     }
-    return formatLogMessage("%@: %@", {toLogArg(device_), toLogArg(offer)}, true);
+    std::optional<std::string> device;
+    if (device_) {
+        device = forLog ? device_->logDescription() : device_->description();
+    }
+    return formatLogMessage("%@: %@", {toLogArg(device), toLogArg(offer)}, true);
 }
 
 Value QAXDeviceInfo::encode() const {

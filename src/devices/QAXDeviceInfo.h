@@ -31,8 +31,9 @@ class QAXDeviceInfo {
     // a record without a device or warranty equals nothing.
     bool isEqual(const QAXDeviceInfo* other) const;
     // "<device description>: Eligible until <date>" while the offer is displayed, else
-    // "<device description>: No offer".
-    std::string description() const;
+    // "<device description>: No offer"; the log's form with the device's.
+    std::string description() const { return describe(false); }
+    std::string logDescription() const { return describe(true); }
 
     // {"$class": "QAXDeviceInfo", "device", "warranty"}; keys whose value is none are left out.
     Value encode() const;
@@ -42,6 +43,8 @@ class QAXDeviceInfo {
     static constexpr bool supportsSecureCoding() { return true; }
 
   private:
+    std::string describe(bool forLog) const;
+
     const std::shared_ptr<QAXDevice> device_;
     const std::shared_ptr<QAXWarranty> warranty_;
 };

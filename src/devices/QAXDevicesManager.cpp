@@ -33,6 +33,15 @@ std::optional<std::string> stringOf(const std::optional<Value>& v) {
     return std::nullopt;
 }
 
+// The serial-number substitution table as the log may show it: both sides are serial numbers.
+Value privateSerialNumbers(const Value::Dictionary& overrides) {
+    Value::Dictionary marked;
+    for (const auto& [from, to] : overrides) {
+        marked[privateText(from)] = to.isString() ? Value(privateText(*to.asString())) : to;
+    }
+    return Value(std::move(marked));
+}
+
 }  // namespace
 
 std::shared_ptr<QAXDevicesManager> QAXDevicesManager::sharedManager(
@@ -78,9 +87,10 @@ QAXDeviceMap QAXDevicesManager::pairedDevices() {
     bool overridden = false;
     if (QAXUtilities::isInternal(*platform_)) {
         auto overrides = platform_->preferences->dictionaryForKey(kPairedWatchesSerialNumbersKey);
-        qaxLog().debug("%s -> pairedDevices pairedWatchesSerialNumbers overrideDict: %@",
-                       kPairedDevicesOperation,
-                       overrides ? std::optional<Value>(Value(*overrides)) : std::nullopt);
+        qaxLog().debug(
+            "%s -> pairedDevices pairedWatchesSerialNumbers overrideDict: %@",
+            kPairedDevicesOperation,
+            overrides ? std::optional<Value>(privateSerialNumbers(*overrides)) : std::nullopt);
         if (overrides) {
             overridden = true;
             const Date now = platform_->clock->now();
@@ -121,7 +131,7 @@ std::vector<PairedDevice> QAXDevicesManager::_activePairedWatches() {
     }
     Value::Array described;
     for (const auto& w : watches) {
-        described.emplace_back(w.description());
+        described.emplace_back(w.logDescription());
     }
     qaxLog().info("%s -> pairedDevices: %@", kActivePairedWatchesOperation,
                   Value(std::move(described)));

@@ -437,7 +437,8 @@ void QAXFollowUp::postFollowUpWithDeviceInfo(const std::shared_ptr<QAXDeviceInfo
 
     std::optional<std::string> error;
     const bool posted = followUpProvider()->postFollowUpItem(item, &error);
-    qaxLog().info("Posted follow-up: serialNumber:%@ -> %@", *serialNumber, outcome(posted, error));
+    qaxLog().info("Posted follow-up: serialNumber:%@ -> %@", privateText(*serialNumber),
+                  outcome(posted, error));
     if (!posted) {
         return;
     }

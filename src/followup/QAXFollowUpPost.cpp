@@ -97,8 +97,7 @@ void QAXFollowUpPost::performActivityForScheduler(const std::shared_ptr<QAXSched
 void QAXFollowUpPost::handleDeviceInfos(const std::shared_ptr<Run>& run,
                                         const std::optional<QAXDeviceInfoList>& deviceInfos) {
     qaxLog().info("%s -> %@", kOperation,
-                  deviceInfos ? QAXFollowUpRefresh::describeDeviceInfos(*deviceInfos)
-                              : std::string("(null)"));
+                  deviceInfos ? logDescriptionOfList(*deviceInfos) : std::string("(null)"));
     if (!deviceInfos) {
         qaxLog().info("Unable to load devices info, defer");
         endRun(run, QAXActivityResultDeferred);

@@ -26,15 +26,6 @@ double intervalFromNow(const std::optional<Date>& date, Date now) {
 QAXFollowUpRefresh::QAXFollowUpRefresh(std::shared_ptr<Platform> platform)
     : platform_(std::move(platform)) {}
 
-std::string QAXFollowUpRefresh::describeDeviceInfos(const QAXDeviceInfoList& deviceInfos) {
-    std::string text = "(\n";
-    for (std::size_t i = 0; i < deviceInfos.size(); ++i) {
-        text += "    " + (deviceInfos[i] ? deviceInfos[i]->description() : std::string("(null)"));
-        text += i + 1 < deviceInfos.size() ? ",\n" : "\n";
-    }
-    return text + ")";
-}
-
 void QAXFollowUpRefresh::performActivityForScheduler(const std::shared_ptr<QAXScheduler>&,
                                                      Completion completion) {
     auto agent = platform_->agentFactory
@@ -54,7 +45,7 @@ void QAXFollowUpRefresh::performActivityForScheduler(const std::shared_ptr<QAXSc
                 QAXFollowUp(self->platform_).refreshFollowupWithDeviceInfos(deviceInfos);
             if (!updated.empty()) {
                 qaxLog().info("Followup present, schedule refresh for %@",
-                              describeDeviceInfos(updated));
+                              logDescriptionOfList(updated));
                 // Over the shown items only: an offer still to be posted is the post
                 // activity's to schedule.
                 const auto next = nextFollowUpRefreshDateWithDevicesInfo(platform, updated, true);

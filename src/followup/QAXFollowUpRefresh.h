@@ -32,9 +32,6 @@ class QAXFollowUpRefresh : public QAXSchedulerActivityDelegate,
     static std::optional<Date> nextFollowUpRefreshDateWithDevicesInfo(
         const Platform& platform, const QAXDeviceInfoList& deviceInfos, bool isInitialCall);
 
-    // A list of device infos in the bracketed form of logs.
-    static std::string describeDeviceInfos(const QAXDeviceInfoList& deviceInfos);
-
   private:
     const std::shared_ptr<Platform> platform_;
 };

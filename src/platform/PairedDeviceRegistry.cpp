@@ -1,11 +1,16 @@
 #include "platform/PairedDeviceRegistry.h"
 
+#include "core/Log.h"
+
 namespace qax {
 
-std::string PairedDevice::description() const {
-    std::string out = name.value_or("(null)");
+std::string PairedDevice::describe(bool markPrivate) const {
+    auto mark = [markPrivate](const std::optional<std::string>& text) {
+        return text ? (markPrivate ? privateText(*text) : *text) : std::string("(null)");
+    };
+    std::string out = mark(name);
     out += " (" + localizedModel.value_or("(null)") + ") ";
-    out += serialNumber.value_or("(null)");
+    out += mark(serialNumber);
     out += " paired ";
     out += pairedDate ? pairedDate->description() : std::string("(null)");
     if (!isPaired) {

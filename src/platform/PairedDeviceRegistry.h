@@ -27,8 +27,11 @@ struct PairedDevice {
     bool isArchived = false;
     bool isAltAccount = false;
 
-    // "<name> (<model>) <serial> paired <date>" and the flags that are set, for logs.
-    std::string description() const;
+    // "<name> (<model>) <serial> paired <date>" and the flags that are set; the log's form
+    // has the name (of the user's choosing) and the serial number private.
+    std::string description() const { return describe(false); }
+    std::string logDescription() const { return describe(true); }
+    std::string describe(bool markPrivate) const;
 };
 
 class PairedDeviceRegistry {

@@ -34,17 +34,6 @@ std::string describeCarriers(const std::vector<SubscriberCarrier>& carriers) {
     return text + ")";
 }
 
-// The devices in the bracketed list form of logs.
-std::string describeDevices(const QAXDeviceMap& devices) {
-    std::string text = "(\n";
-    std::size_t i = 0;
-    for (const auto& [serial, device] : devices) {
-        text += "    " + (device ? device->description() : std::string("(null)"));
-        text += ++i < devices.size() ? ",\n" : "\n";
-    }
-    return text + ")";
-}
-
 bool toggleContains(const std::optional<Value>& toggle, const std::string& identifier) {
     const Value::Array* list = toggle ? toggle->asArray() : nullptr;
     if (!list) {
@@ -120,8 +109,12 @@ void QAXOutreachActivityUtilities::performOutreachActivityForConversion(
         }));
 
     const QAXDeviceMap devices = devices_->allDevices();
+    std::vector<std::shared_ptr<QAXDevice>> listed;
+    for (const auto& [serial, device] : devices) {
+        listed.push_back(device);
+    }
     qaxLog().info("%s: -- Conversion: %d -- devices: %@", kPerformOperation, conversion ? 1 : 0,
-                  describeDevices(devices));
+                  logDescriptionOfList(listed));
 
     const Download download =
         downloads_(conversion ? kConversionOutreachCallingProcess : kOutreachCallingProcess);
@@ -174,8 +167,8 @@ void QAXOutreachActivityUtilities::performOutreachActivityForConversion(
 void QAXOutreachActivityUtilities::handleDownload(Run& run, const std::string& serialNumber,
                                                   bool success,
                                                   const std::shared_ptr<QAXWarranty>& warranty) {
-    qaxLog().info("serialNumber: %@ success: %d -- Conversion: %d", serialNumber, success ? 1 : 0,
-                  run.conversion ? 1 : 0);
+    qaxLog().info("serialNumber: %@ success: %d -- Conversion: %d", privateText(serialNumber),
+                  success ? 1 : 0, run.conversion ? 1 : 0);
     if (!success || !warranty) {
         qaxLog().error("Warranty failed to download");
         return;
