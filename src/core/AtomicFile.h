@@ -11,10 +11,11 @@
 
 namespace qax {
 
-// Creates missing parent directories first. False with `error` set on failure; the old
+// Files are private to their owner unless `mode` says otherwise. Creates missing parent
+// directories first. False with `error` set on failure; the old
 // file is then untouched.
 bool writeFileAtomically(const std::string& path, std::string_view data,
-                         std::string* error = nullptr, mode_t mode = 0644);
+                         std::string* error = nullptr, mode_t mode = 0600);
 
 // The whole content of a file, or no value when it cannot be read.
 std::optional<std::string> readWholeFile(const std::string& path,

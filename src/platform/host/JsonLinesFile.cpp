@@ -16,7 +16,7 @@ bool JsonLinesFile::append(const std::string& path, const Value& record, std::st
     line += '\n';
     std::error_code ec;
     std::filesystem::create_directories(std::filesystem::path(path).parent_path(), ec);
-    const int fd = ::open(path.c_str(), O_WRONLY | O_APPEND | O_CREAT | O_CLOEXEC, 0644);
+    const int fd = ::open(path.c_str(), O_WRONLY | O_APPEND | O_CREAT | O_CLOEXEC, 0600);
     if (fd < 0) {
         if (error) {
             *error = "cannot open " + path + ": " + std::strerror(errno);
