@@ -2,7 +2,6 @@
 #include <gtest/gtest.h>
 
 #include <cmath>
-#include <set>
 
 #include "agent/QAXAgent.h"
 #include "agent/QAXAgentRemoteInterface.h"
@@ -152,25 +151,7 @@ TEST_F(QAXAgentRemoteInterfaceTest, ErrorsNameTheExpectedArguments) {
     EXPECT_EQ(invoke("noSuchOperation:", {}).reply.error, "unknown operation 'noSuchOperation:'");
 }
 
-TEST_F(QAXAgentRemoteInterfaceTest, DeviceRepliesAreArchives) {
-    auto one = invoke("defaultDevice:", {});
-    ASSERT_TRUE(one.reply.value);
-    auto device = QAXDevice::decode(*one.reply.value);
-    ASSERT_NE(device, nullptr);
-    EXPECT_EQ(device->serialNumber(), "PHONE1");
-    EXPECT_EQ(device->activationDate(), Date(10));
-
-    auto many = invoke("pairedDevices:", {});
-    ASSERT_TRUE(many.reply.value && many.reply.value->isArray());
-    std::set<std::string> serials;
-    for (const auto& archived : *many.reply.value->asArray()) {
-        auto d = QAXDevice::decode(archived);
-        ASSERT_NE(d, nullptr);
-        EXPECT_EQ(d->deviceType(), QAXDeviceTypeWatch);
-        serials.insert(d->serialNumber().value_or(""));
-    }
-    EXPECT_EQ(serials, (std::set<std::string>{"W1", "W2"}));
-
+TEST_F(QAXAgentRemoteInterfaceTest, NoPairedDevicesIsAnEmptyList) {
     devices->watches.clear();
     auto none = invoke("pairedDevices:", {});
     ASSERT_TRUE(none.reply.value);
@@ -194,16 +175,6 @@ TEST_F(QAXAgentRemoteInterfaceTest, ObjectThatIsNotAnAgentGetsAnError) {
     auto out = invoke("defaultDevice:", {}, std::make_shared<NotAnAgent>());
     EXPECT_EQ(out.calls, 1);
     EXPECT_TRUE(out.reply.error);
-}
-
-TEST(QAXAgentCreationTest, CallingProcessFallsBackToTheSettingsApplication) {
-    test::TestPlatform env;
-    EXPECT_EQ(QAXAgent::initWithCallingProcessBundleID(env.platform, "com.example.client")
-                  ->callingProcessBundleID(),
-              "com.example.client");
-    EXPECT_EQ(QAXAgent::initWithCallingProcessBundleID(env.platform, std::nullopt)
-                  ->callingProcessBundleID(),
-              "com.velmora.Preferences");
 }
 
 }  // namespace
