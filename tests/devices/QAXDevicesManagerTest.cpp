@@ -54,11 +54,9 @@ TEST_F(QAXDevicesManagerTest, DefaultDeviceSerialNumberAndOverride) {
     EXPECT_EQ(d->serialNumber(), "C02TESTSERIAL") << "a non-internal build ignores the override";
     EXPECT_EQ(d->activationDate(), Date(1'650'000'000));
     EXPECT_EQ(d->deviceType(), QAXDeviceTypeDefault);
-    EXPECT_TRUE(env.log->contains("default device SerialNumber: 'C02TESTSERIAL'"));
 
     device().internal = true;
     EXPECT_EQ(manager.defaultDevice()->serialNumber(), "OVERRIDE1");
-    EXPECT_TRUE(env.log->contains("default device SerialNumber Override = OVERRIDE1"));
 
     prefs()->removeObject("SerialNumber");
     device().set("SerialNumber", std::nullopt);
@@ -74,12 +72,10 @@ TEST_F(QAXDevicesManagerTest, PairedWatchesAreGatedByFlagAndServer) {
     flags->set("Kestova", "Tessel_3_0", false);
     EXPECT_TRUE(manager.pairedDevices().empty());
     EXPECT_EQ(serials(manager.allDevices()), std::vector<std::string>{"C02TESTSERIAL"});
-    EXPECT_TRUE(env.log->contains("Tessel 3.0 disabled by feature flag, ignore paired devices"));
 
     flags->set("Kestova", "Tessel_3_0", true);
     serverVersions(1, 2);  // the agent's high version 3 is not offered
     EXPECT_TRUE(manager.pairedDevices().empty());
-    EXPECT_TRUE(env.log->contains("Tessel 3.0 disabled by server, ignore paired devices"));
 }
 
 TEST_F(QAXDevicesManagerTest, OnlyActivePairedWatchesWithSerialNumbersAreListed) {

@@ -18,7 +18,7 @@ std::shared_ptr<const AccessControl> ScriptedAttestationService::createPrivateKe
         }
         return nullptr;
     }
-    return ForwardingAttestationService::createPrivateKeyAccessControl(accessibility, error);
+    return target_->createPrivateKeyAccessControl(accessibility, error);
 }
 
 void ScriptedAttestationService::issueClientCertificate(const AttestationOptions& options,
@@ -43,7 +43,7 @@ void ScriptedAttestationService::issueClientCertificate(const AttestationOptions
         return;
     }
     // Every other step starts from the target's answer and changes it.
-    ForwardingAttestationService::issueClientCertificate(
+    target_->issueClientCertificate(
         options, [this, step, completion = std::move(completion)](
                      std::shared_ptr<AttestationKey> key, std::optional<CertificateChain> chain,
                      std::optional<AttestationError> error) mutable {
@@ -87,7 +87,7 @@ void ScriptedAttestationService::releaseHeldCompletion() {
         held = std::move(held_.front());
         held_.erase(held_.begin());
     }
-    ForwardingAttestationService::issueClientCertificate(held.first, std::move(held.second));
+    target_->issueClientCertificate(held.first, std::move(held.second));
 }
 
 }  // namespace qax::test

@@ -1,8 +1,6 @@
-// Test doubles of the attestation service. ForwardingAttestationService passes every
-// operation to a target, so a fake can change one; ScriptedAttestationService answers each
-// issuance from a script (forward to the target, fail with a code, hand out a key without a
-// chain, or never answer), on threads of its own, and records the options it was given.
-// Thread-safe.
+// A test double of the attestation service over a real target: it answers each issuance from a
+// script (forward to the target, fail with a code, hand out a key without a chain, or never
+// answer), on threads of its own, and records the options it was given. Thread-safe.
 #pragma once
 
 #include <deque>
@@ -14,34 +12,7 @@
 
 namespace qax::test {
 
-class ForwardingAttestationService : public AttestationService {
-  public:
-    explicit ForwardingAttestationService(std::shared_ptr<AttestationService> target)
-        : target_(std::move(target)) {}
-
-    bool isAttestationSupported() override { return target_->isAttestationSupported(); }
-    std::shared_ptr<const AccessControl> createPrivateKeyAccessControl(
-        KeyAccessibility accessibility, std::string* error) override {
-        return target_->createPrivateKeyAccessControl(accessibility, error);
-    }
-    void issueClientCertificate(
-        const AttestationOptions& options,
-        std::function<void(std::shared_ptr<AttestationKey>, std::optional<CertificateChain>,
-                           std::optional<AttestationError>)>
-            completion) override {
-        target_->issueClientCertificate(options, std::move(completion));
-    }
-    bool isMissingUVXTError(const AttestationError& error) override {
-        return target_->isMissingUVXTError(error);
-    }
-
-    const std::shared_ptr<AttestationService>& target() const { return target_; }
-
-  private:
-    std::shared_ptr<AttestationService> target_;
-};
-
-class ScriptedAttestationService : public ForwardingAttestationService {
+class ScriptedAttestationService : public AttestationService {
   public:
     struct Step {
         enum Kind {
@@ -56,7 +27,8 @@ class ScriptedAttestationService : public ForwardingAttestationService {
         long code = 0;
     };
 
-    using ForwardingAttestationService::ForwardingAttestationService;
+    explicit ScriptedAttestationService(std::shared_ptr<AttestationService> target)
+        : target_(std::move(target)) {}
 
     bool isAttestationSupported() override { return supported; }
     std::shared_ptr<const AccessControl> createPrivateKeyAccessControl(
@@ -67,6 +39,9 @@ class ScriptedAttestationService : public ForwardingAttestationService {
         std::function<void(std::shared_ptr<AttestationKey>, std::optional<CertificateChain>,
                            std::optional<AttestationError>)>
             completion) override;
+    bool isMissingUVXTError(const AttestationError& error) override {
+        return target_->isMissingUVXTError(error);
+    }
 
     // Joins the threads that ran completions.
     void drain() { threads_.drain(); }
@@ -83,6 +58,7 @@ class ScriptedAttestationService : public ForwardingAttestationService {
         std::function<void(std::shared_ptr<AttestationKey>, std::optional<CertificateChain>,
                            std::optional<AttestationError>)>;
 
+    std::shared_ptr<AttestationService> target_;
     std::mutex mutex_;
     std::vector<AttestationOptions> calls_;
     std::vector<std::pair<AttestationOptions, Completion>> held_;

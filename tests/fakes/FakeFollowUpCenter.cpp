@@ -23,7 +23,6 @@ bool InMemoryFollowUpCenter::postFollowUpItem(const std::string& clientIdentifie
     if (fail(postError_, error)) {
         return false;
     }
-    ++posts_;
     auto& list = items_[clientIdentifier];
     auto same = std::find_if(list.begin(), list.end(), [&](const FollowUpItem& pending) {
         return pending.uniqueIdentifier == item.uniqueIdentifier;
@@ -98,11 +97,6 @@ void InMemoryFollowUpCenter::setItems(const std::string& clientIdentifier,
                                       std::vector<FollowUpItem> items) {
     std::lock_guard lock(mutex_);
     items_[clientIdentifier] = std::move(items);
-}
-
-int InMemoryFollowUpCenter::postCount() const {
-    std::lock_guard lock(mutex_);
-    return posts_;
 }
 
 int InMemoryFollowUpCenter::clearCount() const {

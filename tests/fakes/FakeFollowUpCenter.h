@@ -1,10 +1,8 @@
-// In-memory doubles of the follow-up service: a forwarding base that a test derives from to
-// override one operation, and a store of items per client identifier that replaces an item
+// An in-memory follow-up service: a store of items per client identifier that replaces an item
 // posted under a pending unique identifier and can be told to fail any operation. Thread-safe.
 #pragma once
 
 #include <map>
-#include <memory>
 #include <mutex>
 #include <optional>
 #include <string>
@@ -13,34 +11,6 @@
 #include "platform/FollowUpCenter.h"
 
 namespace qax::test {
-
-class ForwardingFollowUpCenter : public FollowUpCenter {
-  public:
-    explicit ForwardingFollowUpCenter(std::shared_ptr<FollowUpCenter> target)
-        : target_(std::move(target)) {}
-
-    bool postFollowUpItem(const std::string& clientIdentifier, const FollowUpItem& item,
-                          std::string* error) override {
-        return target_->postFollowUpItem(clientIdentifier, item, error);
-    }
-    bool clearPendingFollowUpItemsWithUniqueIdentifiers(
-        const std::string& clientIdentifier, const std::vector<std::string>& uniqueIdentifiers,
-        std::string* error) override {
-        return target_->clearPendingFollowUpItemsWithUniqueIdentifiers(clientIdentifier,
-                                                                       uniqueIdentifiers, error);
-    }
-    std::vector<FollowUpItem> pendingFollowUpItems(const std::string& clientIdentifier,
-                                                   std::string* error) override {
-        return target_->pendingFollowUpItems(clientIdentifier, error);
-    }
-    bool clearNotificationForItem(const std::string& clientIdentifier, const FollowUpItem& item,
-                                  std::string* error) override {
-        return target_->clearNotificationForItem(clientIdentifier, item, error);
-    }
-
-  private:
-    std::shared_ptr<FollowUpCenter> target_;
-};
 
 class InMemoryFollowUpCenter : public FollowUpCenter {
   public:
@@ -60,7 +30,6 @@ class InMemoryFollowUpCenter : public FollowUpCenter {
     std::optional<FollowUpItem> item(const std::string& clientIdentifier,
                                      const std::string& uniqueIdentifier) const;
     void setItems(const std::string& clientIdentifier, std::vector<FollowUpItem> items);
-    int postCount() const;
     int clearCount() const;
 
     // While set, the operation fails with this error text and changes nothing.
@@ -76,7 +45,6 @@ class InMemoryFollowUpCenter : public FollowUpCenter {
     std::optional<std::string> clearError_;
     std::optional<std::string> listError_;
     std::optional<std::string> clearNotificationError_;
-    int posts_ = 0;
     int clears_ = 0;
 };
 

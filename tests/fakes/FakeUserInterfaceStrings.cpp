@@ -4,9 +4,8 @@ namespace qax::test {
 
 std::string FakeUserInterfaceStrings::localizedString(std::string_view key,
                                                       std::string_view defaultValue,
-                                                      std::string_view table) {
+                                                      std::string_view /*table*/) {
     std::lock_guard lock(mutex_);
-    tables_.emplace_back(table);
     auto it = texts_.find(key);
     return it == texts_.end() ? std::string(defaultValue) : it->second;
 }
@@ -14,11 +13,6 @@ std::string FakeUserInterfaceStrings::localizedString(std::string_view key,
 void FakeUserInterfaceStrings::set(const std::string& key, const std::string& text) {
     std::lock_guard lock(mutex_);
     texts_.insert_or_assign(key, text);
-}
-
-std::vector<std::string> FakeUserInterfaceStrings::tablesAsked() const {
-    std::lock_guard lock(mutex_);
-    return tables_;
 }
 
 }  // namespace qax::test

@@ -1,11 +1,10 @@
 // User-interface strings from a table a test fills: key -> text, for every table alike; a key
-// not in it gives the default value. Remembers the tables it was asked for. Thread-safe.
+// not in it gives the default value. Thread-safe.
 #pragma once
 
 #include <map>
 #include <mutex>
 #include <string>
-#include <vector>
 
 #include "platform/UserInterfaceStrings.h"
 
@@ -17,7 +16,6 @@ class FakeUserInterfaceStrings : public UserInterfaceStrings {
                                 std::string_view table) override;
 
     void set(const std::string& key, const std::string& text);
-    std::vector<std::string> tablesAsked() const;
 
   private:
     mutable std::mutex mutex_;
@@ -26,7 +24,6 @@ class FakeUserInterfaceStrings : public UserInterfaceStrings {
         {"CLEAR_NOTIFICATION", "Clear"},
         {"INSTALLED", "Installed"},
     };
-    std::vector<std::string> tables_;
 };
 
 }  // namespace qax::test

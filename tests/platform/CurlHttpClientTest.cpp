@@ -76,49 +76,6 @@ HttpResult sendAndWait(HttpClient& client, const HttpRequest& request) {
     return future.get();
 }
 
-std::optional<std::string> responseHeader(const HttpResult& r, const std::string& name) {
-    for (const auto& [n, v] : r.response->headers) {
-        if (strcasecmp(n.c_str(), name.c_str()) == 0) {
-            return v;
-        }
-    }
-    return std::nullopt;
-}
-
-TEST(CurlHttpClientTest, GetAndPostCarryMethodHeadersAndBody) {
-    TestHttpsServer server;
-    server.server().Get("/echo", [](const httplib::Request& req, httplib::Response& res) {
-        res.set_header("X-Reply", "yes");
-        res.set_content("GET|" + req.get_header_value("X-Test"), "text/plain");
-    });
-    server.server().Post("/echo", [](const httplib::Request& req, httplib::Response& res) {
-        res.status = 201;
-        res.set_content("POST|" + req.get_header_value("X-Test") + "|" +
-                            req.get_header_value("Content-Type") + "|" + req.body,
-                        "text/plain");
-    });
-    server.start();
-    CurlHttpClient client(trusting(server));
-
-    HttpRequest get(server.url("/echo"));
-    get.setValue("X-Test", "one");
-    auto got = sendAndWait(client, get);
-    ASSERT_TRUE(got.response) << got.error;
-    EXPECT_EQ(got.response->statusCode, 200);
-    EXPECT_EQ(got.response->body, "GET|one");
-    EXPECT_EQ(responseHeader(got, "x-reply"), "yes");
-
-    HttpRequest post(server.url("/echo"), 5);
-    post.setMethod("POST");
-    post.setValue("X-Test", "two");
-    post.setValue("Content-Type", "application/json");
-    post.setBody(std::string(4000, 'b'));  // large enough that an "Expect" wait would show
-    auto posted = sendAndWait(client, post);
-    ASSERT_TRUE(posted.response) << posted.error;
-    EXPECT_EQ(posted.response->statusCode, 201);
-    EXPECT_EQ(posted.response->body, "POST|two|application/json|" + std::string(4000, 'b'));
-}
-
 TEST(CurlHttpClientTest, RunsTransfersConcurrentlyAndCompletesEachOnceOnTheSessionThread) {
     constexpr int kTransfers = 6;
     Gate gate;  // outlives the server's handler threads

@@ -9,9 +9,9 @@
 #include <vector>
 
 #include "core/PlistCodec.h"
+#include "fakes/FakeNotificationCenter.h"
 #include "fakes/FakeServices.h"
 #include "fakes/TestPlatform.h"
-#include "platform/SystemNotificationCenter.h"
 #include "platform/host/HostActivityRegistry.h"
 #include "platform/host/HostBackgroundActivityScheduler.h"
 #include "platform/host/SimulatedClock.h"
@@ -31,34 +31,6 @@ constexpr const char* kLaunchConfiguration = R"(<?xml version="1.0" encoding="UT
   <key>net</key><dict><key>Trigger</key><string>interval</string>
     <key>Interval</key><integer>0</integer><key>RequiresNetwork</key><true/></dict>
 </dict></plist>)";
-
-// Delivers posted names to registrations at once, on their queues.
-class LocalNotificationCenter : public SystemNotificationCenter {
-  public:
-    std::int32_t registerForNotification(const std::string& name, std::shared_ptr<TaskRunner> queue,
-                                         std::function<void()> handler) override {
-        handlers_[++next_] = {name, queue, std::move(handler)};
-        return next_;
-    }
-    void cancelRegistration(std::int32_t token) override { handlers_.erase(token); }
-    bool postNotification(const std::string& name) override {
-        for (auto& [token, h] : handlers_) {
-            if (h.name == name) {
-                h.queue->post(h.handler);
-            }
-        }
-        return true;
-    }
-
-  private:
-    struct Registration {
-        std::string name;
-        std::shared_ptr<TaskRunner> queue;
-        std::function<void()> handler;
-    };
-    std::int32_t next_ = 0;
-    std::map<std::int32_t, Registration> handlers_;
-};
 
 class Harness {
   public:
@@ -305,7 +277,7 @@ TEST(HostBackgroundActivityScheduler, ClockJumpFiresWhatCameDue) {
     Harness h;
     auto simulated = std::make_shared<SimulatedClock>(h.env.platform->platformRoot, h.env.clock);
     h.env.platform->clock = simulated;
-    h.env.platform->notifications = std::make_shared<LocalNotificationCenter>();
+    h.env.platform->notifications = std::make_shared<test::FakeNotificationCenter>();
     h.clockChanged = [simulated] { simulated->reloadOffset(); };
     h.restart();
 

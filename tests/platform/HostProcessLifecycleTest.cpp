@@ -39,12 +39,10 @@ TEST(HostProcessLifecycleTest, ExitsOnlyWhenStartedOnDemandAndNothingIsOpen) {
         {"client connected", true, {"client connection"}, false, 3600, false},
         {"activity running", true, {"activity run"}, false, 3600, false},
         {"download outstanding", true, {"HTTP request"}, false, 3600, false},
-        {"all three",
-         true,
-         {"client connection", "activity run", "HTTP request"},
-         false,
-         3600,
+        // clang-format off
+        {"all three", true, {"client connection", "activity run", "HTTP request"}, false, 3600,
          false},
+        // clang-format on
         {"clean exit when idle: at once", true, {}, true, 0, true},
         {"clean exit with a client", true, {"client connection"}, true, 3600, false},
         {"clean exit with a download", true, {"HTTP request"}, true, 3600, false},

@@ -85,8 +85,8 @@ class OutreachTest : public ::testing::Test {
             });
     }
     void releaseLocked() {
-        for (auto& [answer, done] : held) {
-            threads.emplace_back([answer, done, wait = rng() % 300] {
+        for (auto& entry : held) {
+            threads.emplace_back([answer = entry.first, done = entry.second, wait = rng() % 300] {
                 std::this_thread::sleep_for(std::chrono::microseconds(wait));
                 done(answer != nullptr, answer);
             });

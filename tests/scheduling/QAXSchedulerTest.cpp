@@ -62,18 +62,15 @@ TEST_F(QAXSchedulerTest, DelayIsClampedAndTruncatedToWholeSeconds) {
         double delay;
         std::int64_t delaySeconds;
         std::int64_t grace;
-        const char* logged;
         bool targetIsNowPlusDelay;
     };
     const Row rows[] = {
-        {25, 25, 2, "25.00", true},         {9.9, 9, 0, "9.90", true},
-        {3600, 3600, 360, "3600.00", true}, {0, 0, 0, "0.00", true},
-        {-30, 0, 0, "-30.00", true},        {std::nan(""), 0, 0, nullptr, false},
-        {inf, 0, 0, nullptr, false},        {-inf, 0, 0, nullptr, false},
+        {25, 25, 2, true},  {9.9, 9, 0, true},   {3600, 3600, 360, true},
+        {0, 0, 0, true},    {-30, 0, 0, true},   {std::nan(""), 0, 0, false},
+        {inf, 0, 0, false}, {-inf, 0, 0, false},
     };
     for (const Row& row : rows) {
         SCOPED_TRACE(row.delay);
-        tp.log->clear();
         const bool network = row.delaySeconds % 2 == 0;
         auto scheduler = make(std::make_shared<RecordingActivity>(network));
         scheduler->scheduleActivityWithDelay(row.delay);
@@ -92,11 +89,6 @@ TEST_F(QAXSchedulerTest, DelayIsClampedAndTruncatedToWholeSeconds) {
         const Date now = tp.clock->now();
         const Date expected = row.targetIsNowPlusDelay ? now.byAdding(row.delay) : now;
         EXPECT_EQ(scheduler->scheduledActivityDate(), expected);
-        if (row.logged) {
-            EXPECT_TRUE(tp.log->contains(
-                "scheduled 'com.velmora.qaxagent.outreach' with delay: " + std::string(row.logged) +
-                " (" + expected.description() + ")"));
-        }
     }
 }
 
@@ -142,7 +134,6 @@ TEST_F(QAXSchedulerTest, FiringDecidesByTheStoredTarget) {
     };
     for (const Row& row : rows) {
         SCOPED_TRACE(row.name);
-        tp.log->clear();
         auto run = std::make_shared<RecordingActivity>();
         auto scheduler = make(run);
         if (row.targetFromNow) {
@@ -152,15 +143,8 @@ TEST_F(QAXSchedulerTest, FiringDecidesByTheStoredTarget) {
         }
         const auto before = activity()->results().size();
         ASSERT_TRUE(activity()->fire());
-        EXPECT_TRUE(
-            tp.log->contains("ZRN activity block occured 'com.velmora.qaxagent.outreach' "
-                             "at (" +
-                             tp.clock->now().description() + ")"));
-
         if (row.delegateResult) {
             EXPECT_EQ(run->runs, 1);
-            EXPECT_TRUE(tp.log->contains(
-                "target reached for 'com.velmora.qaxagent.outreach', trigger activity"));
             ASSERT_TRUE(run->pending);
             run->pending(*row.delegateResult);
         } else {
@@ -186,8 +170,6 @@ TEST_F(QAXSchedulerTest, MonitoringAttachesToThePreregisteredActivity) {
     auto scheduler = make(delegate);
     scheduler->monitorForScheduledActivity();
     EXPECT_TRUE(activity()->preregistered());
-    EXPECT_TRUE(
-        tp.log->contains("monitorForScheduledActivity for 'com.velmora.qaxagent.outreach'"));
 
     // A wake-up of the pre-registered activity with a target still in the future defers.
     tp.platform->preferences->setObject(QAXScheduler::targetDateKey(kIdentifier),
@@ -197,9 +179,6 @@ TEST_F(QAXSchedulerTest, MonitoringAttachesToThePreregisteredActivity) {
     tp.clock->advanceBy(120);
     activity()->fire();
     EXPECT_EQ(delegate->runs, 1);
-    EXPECT_TRUE(tp.log->contains("activity for 'com.velmora.qaxagent.outreach' should occur on: " +
-                                 tp.clock->now().description()));
-    EXPECT_FALSE(tp.log->contains("ZRN activity block occured"));
 
     activity()->setShouldDefer(true);
     EXPECT_TRUE(scheduler->shouldDefer());
@@ -246,8 +225,6 @@ TEST_F(QAXSchedulerTest, ClearRemovesOnlyTargetDates) {
     std::sort(keys.begin(), keys.end());
     EXPECT_EQ(keys, (std::vector<std::string>{"FollowupPostedSerialNumberHashes", "TargetDate",
                                               "com.velmora.qaxagent.outreach.TargetDate.old"}));
-    EXPECT_EQ(tp.log->countContaining("Clearing "), 7);
-    EXPECT_TRUE(tp.log->contains("Clearing something.else.TargetDate"));
 }
 
 }  // namespace

@@ -56,76 +56,47 @@ TEST(QAXVelmoraSupportManagerTest, InstalledThenPurchasedThenStore) {
         std::function<void(Env&)> setUp;
         std::string expected;
         int purchaseQueries, lookups;
-    } rows[] = {
+    };
+    // The answer with its keys in the order of the columns below; "-" leaves a key out.
+    auto answer = [](const std::string& link, const std::string& icon, const std::string& title,
+                     const std::string& vendor, const std::string& text, int type) {
+        Value::Dictionary d{{"AppAvailabilityType", type}};
+        const std::pair<const char*, const std::string*> keys[] = {{"AppLinkURL", &link},
+                                                                   {"AppIconURL", &icon},
+                                                                   {"AppTitleKey", &title},
+                                                                   {"AppVendorName", &vendor},
+                                                                   {"AppAvailablityText", &text}};
+        for (const auto& [key, value] : keys) {
+            if (*value != "-") {
+                d[key] = *value;
+            }
+        }
+        return dict(d);
+    };
+    const std::string store = "Free – On the Marketa";
+    // clang-format off
+    const Row rows[] = {
         {"installed", [](Env& e) { e.apps->records[0].installed = true; },
-         dict({{"AppTitleKey", "Support App"},
-               {"AppVendorName", "Velmora"},
-               {"AppAvailablityText", "Installée"},
-               {"AppAvailabilityType", 1}}),
-         0, 0},
-        {"purchased",
-         [&](Env& e) {
-             e.purchases->records = {other, {kApp, "Support", "Velmora Inc.", "https://store/p"}};
-         },
-         dict({{"AppLinkURL", "https://store/p" + kCampaign},
-               {"AppTitleKey", "Support"},
-               {"AppVendorName", "Velmora Inc."},
-               {"AppAvailablityText", "DOWNLOAD"},
-               {"AppAvailabilityType", 2}}),
-         1, 0},
-        {"purchase without texts",
-         [](Env& e) {
-             e.purchases->records = {{kApp, {}, {}, {}}};
-         },
-         dict({{"AppLinkURL", ""},
-               {"AppTitleKey", "== Velmora Support =="},
-               {"AppVendorName", "== Velmora =="},
-               {"AppAvailablityText", "DOWNLOAD"},
-               {"AppAvailabilityType", 2}}),
-         1, 0},
-        {"in the store",
-         [&](Env& e) {
-             e.purchases->records = {other};
-             e.store->items = {listing};
-         },
-         dict({{"AppLinkURL", "https://store/app" + kCampaign},
-               {"AppIconURL", "https://img/1"},
-               {"AppTitleKey", "Support"},
-               {"AppVendorName", "Velmora Inc."},
-               {"AppAvailablityText", "Free – On the Marketa"},
-               {"AppAvailabilityType", 3}}),
+         answer("-", "-", "Support App", "Velmora", "Installée", 1), 0, 0},
+        {"purchased", [&](Env& e) {
+             e.purchases->records = {other, {kApp, "Support", "Velmora Inc.", "https://store/p"}}; },
+         answer("https://store/p" + kCampaign, "-", "Support", "Velmora Inc.", "DOWNLOAD", 2), 1, 0},
+        {"purchase without texts", [](Env& e) { e.purchases->records = {{kApp, {}, {}, {}}}; },
+         answer("", "-", "== Velmora Support ==", "== Velmora ==", "DOWNLOAD", 2), 1, 0},
+        {"in the store", [&](Env& e) { e.purchases->records = {other}; e.store->items = {listing}; },
+         answer("https://store/app" + kCampaign, "https://img/1", "Support", "Velmora Inc.", store, 3),
          1, 1},
-        {"listing without URLs or names",
-         [](Env& e) {
-             e.store->items = {{kApp, {}, {}, {}, ""}};
-         },
-         dict({{"AppLinkURL", ""},
-               {"AppIconURL", ""},
-               {"AppTitleKey", ""},
-               {"AppVendorName", ""},
-               {"AppAvailablityText", "Free – On the Marketa"},
-               {"AppAvailabilityType", 3}}),
-         1, 1},
-        {"two store items",
-         [&](Env& e) {
-             e.store->items = {listing, listing};
-         },
+        {"listing without URLs or names", [](Env& e) { e.store->items = {{kApp, {}, {}, {}, ""}}; },
+         answer("", "", "", "", store, 3), 1, 1},
+        {"two store items", [&](Env& e) { e.store->items = {listing, listing}; },
          dict({{"AppAvailabilityType", 0}}), 1, 1},
-        {"store error",
-         [&](Env& e) {
-             e.store->items = {listing};
-             e.store->error = "offline";
-         },
+        {"store error", [&](Env& e) { e.store->items = {listing}; e.store->error = "offline"; },
          dict({}), 1, 1},
         {"no store result", [](Env&) {}, dict({}), 1, 1},
-        {"forced",
-         [](Env& e) { e.tp.platform->preferences->setObject("AppSupportAvailability", true); },
-         dict({{"AppTitleKey", "Velmora Support"},
-               {"AppVendorName", "Velmora"},
-               {"AppAvailablityText", "OVERRIDE"},
-               {"AppAvailabilityType", 1}}),
-         1, 0},
+        {"forced", [](Env& e) { e.tp.platform->preferences->setObject("AppSupportAvailability", true); },
+         answer("-", "-", "Velmora Support", "Velmora", "OVERRIDE", 1), 1, 0},
     };
+    // clang-format on
     for (const auto& row : rows) {
         SCOPED_TRACE(row.name);
         Env env;

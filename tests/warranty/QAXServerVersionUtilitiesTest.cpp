@@ -148,9 +148,6 @@ TEST_F(QAXServerVersionUtilitiesTest, OverlapOfTheEndPointsDecidesSupportAndTheH
         EXPECT_EQ(highEnabled(QAXServerLookupPolicyCacheFirst), c.enabled);
         EXPECT_EQ(QAXServerVersionUtilities::isHighServerVersionFeaturesetEnabled(*tp.platform),
                   c.enabled);
-        EXPECT_EQ(tp.log->count(c.enabled ? "High Server version supported - YES"
-                                          : "High Server version supported - NO"),
-                  2);
         EXPECT_EQ(hits(), before + 2);
     }
 }
@@ -316,15 +313,6 @@ TEST_F(QAXServerVersionUtilitiesTest, ACacheThatIsNoDictionaryIsRemovedAndIgnore
     EXPECT_TRUE(QAXServerVersionUtilities::isHighServerVersionFeaturesetEnabled(*tp.platform));
     EXPECT_EQ(tp.log->count("Using Client version: " + versionList(2, 3).description()), 1);
     EXPECT_FALSE(cache());
-}
-
-TEST_F(QAXServerVersionUtilitiesTest, TheWebFlowOverrideIsHandedOutAsStored) {
-    constexpr const char* kLogged = "+[QAXServerVersionUtilities readWebURLOverride]";
-    EXPECT_FALSE(QAXServerVersionUtilities::readWebURLOverride(*tp.platform));
-    preferences().setObject("WebFlowURL", "https://flow.example/start");
-    EXPECT_EQ(QAXServerVersionUtilities::readWebURLOverride(*tp.platform),
-              Value("https://flow.example/start"));
-    EXPECT_EQ(tp.log->count(kLogged), 2);
 }
 
 }  // namespace

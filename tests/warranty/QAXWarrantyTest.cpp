@@ -78,43 +78,26 @@ TEST_F(QAXWarrantyTest, ConversionDateComesFromTheSettingThenTheSummaryThenTheEn
         std::optional<Value> oneDayInterval;
         std::optional<double> expected;
     };
+    const char* kEnd = R"({"coverageEndDate": 1700000000})";
+    // clang-format off
     const Case cases[] = {
-        {"absent: end date plus a day", R"({"coverageEndDate": 1700000000})", {}, {}, kNow + kDay},
-        {"absent: end date plus the day length as stored",
-         R"({"coverageEndDate": 1700000000})",
-         {},
-         Value(3600),
-         kNow + 3600},
+        {"absent: end date plus a day", kEnd, {}, {}, kNow + kDay},
+        {"absent: end date plus the day length as stored", kEnd, {}, Value(3600), kNow + 3600},
         {"absent without an end date", R"({})", {}, {}, {}},
         {"zero", R"({"coverageEndDate": 1700000000, "hvOfferConversionDate": 0})", {}, {}, {}},
-        {"seconds",
-         R"({"coverageEndDate": 1, "hvOfferConversionDate": 1700500000})",
-         {},
-         {},
+        {"seconds", R"({"coverageEndDate": 1, "hvOfferConversionDate": 1700500000})", {}, {},
          1700500000},
         {"milliseconds", R"({"hvOfferConversionDate": 1700500000000})", {}, {}, 1700500000},
-        {"not a number",
-         R"({"coverageEndDate": 1700000000, "hvOfferConversionDate": "soon"})",
-         {},
-         {},
-         {}},
+        {"not a number", R"({"coverageEndDate": 1700000000, "hvOfferConversionDate": "soon"})", {},
+         {}, {}},
         {"setting over zero", R"({"hvOfferConversionDate": 0})", Value(1800000000), {}, 1800000000},
-        {"setting over a date",
-         R"({"hvOfferConversionDate": 1700500000})",
-         Value(1800000000000LL),
-         {},
-         1800000000},
-        {"setting over the end date",
-         R"({"coverageEndDate": 1700000000})",
-         Value(1800000000),
-         {},
-         1800000000},
-        {"setting that is not a number is ignored",
-         R"({"hvOfferConversionDate": 1700500000})",
-         Value("1800000000"),
-         {},
-         1700500000},
+        {"setting over a date", R"({"hvOfferConversionDate": 1700500000})", Value(1800000000000LL),
+         {}, 1800000000},
+        {"setting over the end date", kEnd, Value(1800000000), {}, 1800000000},
+        {"setting that is not a number is ignored", R"({"hvOfferConversionDate": 1700500000})",
+         Value("1800000000"), {}, 1700500000},
     };
+    // clang-format on
     for (const auto& c : cases) {
         SCOPED_TRACE(c.name);
         preferences().removeObject("ConversionDate");
@@ -152,20 +135,12 @@ TEST_F(QAXWarrantyTest, DayCountAndOfferTextFollowTheClockDayLengthAndLocale) {
         {"grouped in English", 1234 * kDay, {}, "en_US", plural, 1234, "1,234 days left"},
         {"grouped in German", 1234 * kDay - 10, {}, "de_DE", plural, 1234, "1.234 days left"},
         {"grouped in French", 1234 * kDay, {}, "fr_FR", plural, 1234, "1\u202f234 days left"},
-        {"Arabic digits",
-         1234 * kDay,
-         {},
-         "ar_EG",
-         plural,
-         1234,
+        // clang-format off
+        {"Arabic digits", 1234 * kDay, {}, "ar_EG", plural, 1234,
          "\u0661\u066c\u0662\u0663\u0664 days left"},
-        {"numbered placeholder and a percent sign",
-         1234 * kDay,
-         {},
-         "en_US",
-         "%1$@ days (100%%)",
-         1234,
-         "1,234 days (100%)"},
+        {"numbered placeholder and a percent sign", 1234 * kDay, {}, "en_US", "%1$@ days (100%%)",
+         1234, "1,234 days (100%)"},
+        // clang-format on
         {"hour-long days", 36 * 3600, 3600, "en_US", plural, 36, "36 days left"},
         {"a day length of 0 means a day", 36 * 3600, 0, "en_US", plural, 2, "2 days left"},
         {"saturates", 1e7, 0.001, "en_US", "%@", 4294967295u, "4,294,967,295"},
@@ -388,15 +363,11 @@ TEST_F(QAXWarrantyTest, FieldsAreReadFromTheirContainersAndKeys) {
 }
 
 TEST_F(QAXWarrantyTest, ARecordIsMadeFromAnyDictionaryAndFromNothingElse) {
-    constexpr const char* kMade = "+[QAXWarranty warrantyWithDictionary:serialNumber:] : 1";
-    constexpr const char* kNotMade = "+[QAXWarranty warrantyWithDictionary:serialNumber:] : 0";
     EXPECT_FALSE(QAXWarranty::warrantyWithDictionary(tp.platform, std::nullopt));
     EXPECT_FALSE(QAXWarranty::warrantyWithDictionary(tp.platform, parseJson("[1, 2]")));
-    EXPECT_EQ(tp.log->count(kNotMade), 2);
 
     auto empty = QAXWarranty::warrantyWithDictionary(tp.platform, Value(Value::Dictionary{}));
     ASSERT_TRUE(empty);
-    EXPECT_EQ(tp.log->count(kMade), 1);
     EXPECT_FALSE(empty->covered());
     EXPECT_EQ(empty->hvOfferDurationBeforeEndDate(), 0);
     EXPECT_FALSE(empty->hvOfferEligibleUntil());
@@ -422,7 +393,6 @@ TEST_F(QAXWarrantyTest, JsonAndPropertyListSummariesMakeEqualRecordsThatPrintThe
     EXPECT_TRUE(fromPlist->hvOfferDisplay());
     EXPECT_EQ(iso(fromPlist->hvOfferEligibleUntil()), "2023-11-20T17:06:40.000Z");
     EXPECT_EQ(fromPlist->description(), fromPlist->dictionaryRepresentation().description());
-    EXPECT_NE(fromPlist->description().find("\"Add the plan\""), std::string::npos);
 
     auto other = fromJson(R"({"covered": false})");
     EXPECT_FALSE(fromPlist->isEqual(other.get()));
@@ -436,15 +406,12 @@ TEST_F(QAXWarrantyTest, ArchivesRoundTripAndRefuseWhatMayNotCrossIPC) {
     summary["fetched"] = Date(1'700'000'000);  // dates may cross too
     auto w = QAXWarranty::warrantyWithDictionary(tp.platform, summary);
     ASSERT_TRUE(w);
-    EXPECT_TRUE(QAXWarranty::supportsSecureCoding());
 
     // Across IPC the archive travels inside a binary property list.
     auto bytes = toBinaryPlist(w->encode());
     ASSERT_TRUE(bytes);
     auto received = parsePlist(*bytes);
     ASSERT_TRUE(received);
-    ASSERT_TRUE(received->find("$class"));
-    EXPECT_EQ(*received->find("$class"), Value("QAXWarranty"));
     auto decoded = QAXWarranty::decode(tp.platform, *received);
     ASSERT_TRUE(decoded);
     EXPECT_TRUE(decoded->isEqual(w.get()));
