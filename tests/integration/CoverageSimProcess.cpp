@@ -1,68 +1,59 @@
 #include "CoverageSimProcess.h"
 
-#include <signal.h>
-#include <sys/wait.h>
 #include <unistd.h>
+
+#include <chrono>
+#include <filesystem>
+#include <thread>
 
 #include "core/AtomicFile.h"
 #include "core/JsonCodec.h"
 
 namespace qax::test {
+namespace {
 
-CoverageSimProcess::CoverageSimProcess(const std::string& state, const std::string& platformRoot,
-                                       const std::vector<std::string>& extraArgs,
-                                       const std::vector<std::string>& environment)
-    : state_(state) {
-    std::vector<std::string> args = {QAX_SIM_BINARY,
-                                     "--state",
+std::vector<std::string> argumentsFor(const std::string& state, const std::string& platformRoot,
+                                      const std::vector<std::string>& extraArgs) {
+    std::vector<std::string> args = {"--state",
                                      state,
                                      "--platform-root",
                                      platformRoot,
                                      "--attestation-root",
                                      platformRoot + "/state/attestation/ca.pem"};
     args.insert(args.end(), extraArgs.begin(), extraArgs.end());
-    // Everything the child needs is built before the fork: only exec-safe calls after it.
-    std::vector<std::string> env(environment);
-    for (char** e = environ; *e; ++e) {
-        env.push_back(*e);
-    }
-    std::vector<char*> argv, envp;
-    for (auto& a : args) {
-        argv.push_back(a.data());
-    }
-    for (auto& e : env) {
-        envp.push_back(e.data());
-    }
-    argv.push_back(nullptr);
-    envp.push_back(nullptr);
-    int out[2];
-    if (pipe(out) != 0) {
-        return;
-    }
-    pid_ = fork();
-    if (pid_ == 0) {
-        dup2(out[1], STDOUT_FILENO);
-        close(out[0]);
-        execve(QAX_SIM_BINARY, argv.data(), envp.data());
-        _exit(127);
-    }
-    close(out[1]);
-    std::string line;
-    char c;
-    while (read(out[0], &c, 1) == 1 && c != '\n') {
-        line += c;
-    }
-    close(out[0]);
-    auto colon = line.rfind(':');
-    if (line.find("listening") != std::string::npos && colon != std::string::npos) {
-        base_ = "https://127.0.0.1:" + line.substr(colon + 1);
-    }
+    return args;
 }
 
-CoverageSimProcess::~CoverageSimProcess() {
-    if (pid_ > 0) {
-        kill(pid_, SIGTERM);
-        waitpid(pid_, nullptr, 0);
+}  // namespace
+
+std::string CoverageSimProcess::prepare(const std::string& state) {
+    std::filesystem::create_directories(state);
+    return state + "/stdout.txt";
+}
+
+std::vector<std::string> CoverageSimProcess::withEnviron(std::vector<std::string> environment) {
+    for (char** e = environ; *e; ++e) {
+        environment.push_back(*e);
+    }
+    return environment;
+}
+
+CoverageSimProcess::CoverageSimProcess(const std::string& state, const std::string& platformRoot,
+                                       const std::vector<std::string>& extraArgs,
+                                       const std::vector<std::string>& environment)
+    : state_(state),
+      process_(QAX_SIM_BINARY, argumentsFor(state, platformRoot, extraArgs),
+               withEnviron(environment), prepare(state), state + "/stderr.txt") {
+    // It prints "... listening on 127.0.0.1:PORT" once it serves.
+    for (int i = 0; i < 2000 && process_.running(); ++i) {
+        const std::string out = readWholeFile(state + "/stdout.txt").value_or("");
+        const auto end = out.find('\n');
+        const auto colon = out.rfind(':', end);
+        if (end != std::string::npos && out.find("listening") < end && colon != std::string::npos) {
+            base_ = "https://127.0.0.1:" + out.substr(colon + 1, end - colon - 1);
+            return;
+        }
+        std::this_thread::sleep_for(std::chrono::milliseconds(5));
     }
 }
 

@@ -3,11 +3,10 @@
 // stopped with SIGTERM when the object goes. Also reads its request log.
 #pragma once
 
-#include <sys/types.h>
-
 #include <string>
 #include <vector>
 
+#include "SpawnedProcess.h"
 #include "core/Value.h"
 
 namespace qax::test {
@@ -18,9 +17,7 @@ class CoverageSimProcess {
     CoverageSimProcess(const std::string& state, const std::string& platformRoot,
                        const std::vector<std::string>& extraArgs = {},
                        const std::vector<std::string>& environment = {});
-    ~CoverageSimProcess();
-    CoverageSimProcess(const CoverageSimProcess&) = delete;
-    CoverageSimProcess& operator=(const CoverageSimProcess&) = delete;
+    ~CoverageSimProcess() { process_.stop(); }
 
     // "https://127.0.0.1:PORT"; empty when the simulator did not start.
     const std::string& base() const { return base_; }
@@ -30,8 +27,11 @@ class CoverageSimProcess {
     std::vector<Value> requestLog() const;
 
   private:
+    static std::string prepare(const std::string& state);
+    static std::vector<std::string> withEnviron(std::vector<std::string> environment);
+
     std::string state_;
-    pid_t pid_ = -1;
+    SpawnedProcess process_;
     std::string base_;
 };
 

@@ -14,7 +14,8 @@
 namespace qax::test {
 
 SpawnedProcess::SpawnedProcess(const std::string& program, std::vector<std::string> args,
-                               std::vector<std::string> environment, const std::string& logPath) {
+                               std::vector<std::string> environment, const std::string& outPath,
+                               const std::string& errPath) {
     args.insert(args.begin(), program);
     std::vector<char*> argv, envp;
     for (auto& s : args) {
@@ -28,9 +29,13 @@ SpawnedProcess::SpawnedProcess(const std::string& program, std::vector<std::stri
     posix_spawn_file_actions_t actions;
     posix_spawn_file_actions_init(&actions);
     posix_spawn_file_actions_addopen(&actions, 0, "/dev/null", O_RDONLY, 0);
-    posix_spawn_file_actions_addopen(&actions, 1, logPath.c_str(), O_WRONLY | O_CREAT | O_APPEND,
-                                     0644);
-    posix_spawn_file_actions_adddup2(&actions, 1, 2);
+    constexpr int kAppend = O_WRONLY | O_CREAT | O_APPEND;
+    posix_spawn_file_actions_addopen(&actions, 1, outPath.c_str(), kAppend, 0644);
+    if (errPath.empty()) {
+        posix_spawn_file_actions_adddup2(&actions, 1, 2);
+    } else {
+        posix_spawn_file_actions_addopen(&actions, 2, errPath.c_str(), kAppend, 0644);
+    }
     if (posix_spawn(&pid_, program.c_str(), &actions, nullptr, argv.data(), envp.data()) != 0) {
         pid_ = -1;
     }
@@ -61,10 +66,17 @@ std::optional<int> SpawnedProcess::waitForExit(double seconds) {
     return status_;
 }
 
-void SpawnedProcess::terminate() {
-    if (running()) {
-        ::kill(pid_, SIGTERM);
+int SpawnedProcess::stop(int signal) {
+    if (!running()) {
+        return status_.value_or(-1);
     }
+    ::kill(pid_, signal);
+    if (auto status = waitForExit(10)) {
+        return *status;
+    }
+    ::kill(pid_, SIGKILL);
+    waitForExit(10);
+    return -1;
 }
 
 std::optional<std::string> findProgram(const std::string& name) {
