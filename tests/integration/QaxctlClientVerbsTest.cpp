@@ -1,7 +1,7 @@
 // qaxctl's client verbs: what each sends, how it prints each kind of reply, and how it
-// reports an agent that is absent, refuses it or answers an error. The replies come from a
-// stand-in on the agent's socket, so every reply shape can be tried; the refusal and one
-// real round trip come from the real agent.
+// reports bad usage, an absent agent or an error reply. The replies come from a stand-in on
+// the agent's socket, so every reply shape can be tried (the real agent's refusal and round
+// trips are in AgentServiceTest).
 #include <gtest/gtest.h>
 #include <poll.h>
 #include <sys/socket.h>
@@ -17,7 +17,6 @@
 #include "core/JsonCodec.h"
 #include "core/PlistCodec.h"
 #include "devices/QAXDeviceInfo.h"
-#include "platform/host/FilePreferenceStore.h"
 #include "platform/host/IpcFrameCodec.h"
 #include "warranty/QAXWarranty.h"
 
@@ -132,6 +131,23 @@ class QaxctlClientVerbsTest : public ::testing::Test {
 };
 
 TEST_F(QaxctlClientVerbsTest, EachVerbSendsItsRequestAndPrintsTheReply) {
+    auto absent = run({"device-info"});
+    EXPECT_EQ(absent.status, 69);
+    EXPECT_NE(absent.err.find("is qaxagent running?"), std::string::npos) << absent.err;
+    for (const auto& args : std::vector<std::vector<std::string>>{
+             {"device-info", "A", "B"},
+             {"device-info", "--policy", "soon"},
+             {"device-infos", "extra"},
+             {"dismiss-notification", "A", "B"},
+             {"schedule-outreach", "--after", "-5"},
+             {"account-added", "--timeout", "soon"},
+             {"store-check", "--json"},
+         }) {
+        auto result = run(args);
+        EXPECT_EQ(result.status, 64) << args[0] << " " << result.err;
+        EXPECT_EQ(result.err.rfind("usage: qaxctl " + args[0], 0), 0u) << result.err;
+    }
+
     FakeAgent fake(agent.runtimeDirectory());
     auto device = QAXDevice::deviceWithName("Morning", "W1", Date(1.7e9), QAXDeviceTypeWatch);
     auto offer = QAXDeviceInfo::deviceInfoWithDevice(
@@ -234,47 +250,6 @@ TEST_F(QaxctlClientVerbsTest, EachVerbSendsItsRequestAndPrintsTheReply) {
     std::filesystem::rename(agent.runtimeDirectory(), agent.home() + "/qaxagent");
     fake.answer(reply(Value(true)));
     EXPECT_EQ(test::runTool(QAX_CTL_BINARY, {"schedule-outreach"}, env).status, 0);
-}
-
-TEST_F(QaxctlClientVerbsTest, BadUsageAndAnAbsentOrRefusingAgent) {
-    const std::vector<std::vector<std::string>> badUsage = {
-        {"device-info", "A", "B"},
-        {"device-info", "--policy", "soon"},
-        {"device-infos", "extra"},
-        {"dismiss-notification", "A", "B"},
-        {"schedule-outreach", "--after", "-5"},
-        {"account-added", "--timeout", "soon"},
-        {"store-check", "--json"},
-    };
-    for (const auto& args : badUsage) {
-        auto result = run(args);
-        EXPECT_EQ(result.status, 64) << args[0] << " " << result.err;
-        EXPECT_EQ(result.err.rfind("usage: qaxctl " + args[0], 0), 0u) << result.err;
-    }
-
-    auto absent = run({"device-info"});
-    EXPECT_EQ(absent.status, 69);
-    EXPECT_NE(absent.err.find("is qaxagent running?"), std::string::npos) << absent.err;
-
-    agent.writeRootFile("device.plist", Value(Value::Dictionary{{"SerialNumber", Value("SN-1")},
-                                                                {"InternalBuild", Value(true)}}));
-    ASSERT_TRUE(agent.start()) << agent.log();
-    auto refused = run({"store-check", "com.velmora.support"});
-    EXPECT_EQ(refused.status, 69);
-    EXPECT_NE(refused.err.find("the agent closed the connection"), std::string::npos)
-        << refused.err;
-
-    // Entitled: a request the agent serves, before and after an override is stored.
-    agent.registerApplication("qaxctl", std::filesystem::canonical(QAX_CTL_BINARY).string(),
-                              "com.velmora.Preferences", Value(true));
-    auto plain = run({"web-url-override"});
-    EXPECT_EQ(plain.status, 0) << plain.err;
-    EXPECT_EQ(plain.out, "no web URL override\n");
-    FilePreferenceStore(FilePreferenceStore::domainPath(agent.home()))
-        .setObject("WebFlowURL", Value("https://flow.example/x"));
-    auto stored = run({"web-url-override", "--json"});
-    EXPECT_EQ(stored.status, 0) << stored.err;
-    EXPECT_EQ(stored.out, "\"https://flow.example/x\"\n");
 }
 
 }  // namespace
