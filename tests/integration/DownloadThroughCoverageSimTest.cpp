@@ -4,6 +4,7 @@
 // still answer the same warranties, and a forced download fails without touching the cache.
 #include <gtest/gtest.h>
 
+#include <filesystem>
 #include <map>
 #include <memory>
 
@@ -38,9 +39,7 @@ Answers answersOf(const Value& reply) {
 TEST(DownloadThroughCoverageSim, ForcedDownloadThenCachedAnswersWithTheServiceStopped) {
     test::AgentProcess agent;
     const std::string root = agent.platformRoot();
-    auto sim = std::make_unique<test::CoverageSimProcess>(
-        agent.home() + "/sim", root,
-        std::vector<std::string>{"--attestation-root", root + "/state/attestation/ca.pem"});
+    auto sim = std::make_unique<test::CoverageSimProcess>(agent.home() + "/sim", root);
     ASSERT_FALSE(sim->base().empty()) << "coverage-sim did not start";
 
     agent.writeRootFile("device.plist", Value::Dictionary{{"SerialNumber", kPhone},
@@ -79,25 +78,44 @@ TEST(DownloadThroughCoverageSim, ForcedDownloadThenCachedAnswersWithTheServiceSt
         return reply ? reply->value : std::nullopt;
     };
 
-    // Forced: both devices are fetched; only this device's request is attested, and the
-    // service verified it.
+    // Forced: the versions are negotiated, the token renewed, both devices fetched; only this
+    // device's request is attested, and the service verified it.
     auto forced = call(kAllDeviceInfos, {Value(2), Value(false)});
     ASSERT_TRUE(forced && forced->isArray());
     const Answers downloaded = answersOf(*forced);
     ASSERT_EQ(downloaded.size(), 2u);
     ASSERT_TRUE(downloaded.at(kPhone) && downloaded.at(kWatch)) << agent.log();
+    EXPECT_EQ(preferences.objectForKey("ServerVersionCache"),
+              Value(Value::Dictionary{{"LowServerVersion", 2}, {"HighServerVersion", 3}}));
     std::map<std::string, std::string> attestation;
+    int renewals = 0;
     for (const Value& request : sim->requestLog()) {
         const std::string path = *request.find("path")->asString();
+        renewals += path == "/token";
         if (path.find("/coverage/summary") != std::string::npos) {
-            const Value* body = request.find("body");
             const std::string serial =
-                body->asString()->find(kPhone) != std::string::npos ? kPhone : kWatch;
+                request.find("body")->asString()->find(kPhone) != std::string::npos ? kPhone
+                                                                                    : kWatch;
             attestation[serial] = *request.find("attestation")->asString();
+            const Value* token = request.find("headers")->find("X-Velmora-KF-Token");
+            EXPECT_EQ(token ? token->asString()->rfind("kf-", 0) : 1, 0u) << "a renewed token";
         }
     }
+    EXPECT_GE(renewals, 1);
     EXPECT_EQ(attestation[kPhone], "valid");
     EXPECT_EQ(attestation[kWatch], "absent");
+    // The signing keys are the user's alone, and the log names the devices only as private.
+    namespace fs = std::filesystem;
+    int keys = 0;
+    for (const auto& key : fs::directory_iterator(root + "/state/keys")) {
+        ++keys;
+        EXPECT_EQ(key.status().permissions() & (fs::perms::group_all | fs::perms::others_all),
+                  fs::perms::none)
+            << key.path();
+    }
+    EXPECT_GE(keys, 1);
+    EXPECT_GE(agent.countInLog("<private> : warranty download attempt"), 2);
+    EXPECT_EQ(agent.countInLog(std::string(kPhone) + " : warranty download attempt"), 0);
 
     // The service goes away; the cache answers alone.
     sim.reset();
