@@ -114,21 +114,10 @@ class OfferRoadTest : public ::testing::Test {
         return agent.countInLog(prefix + "finished") + agent.countInLog(prefix + "reported");
     }
     bool waitForEnds(const std::string& activity, int count) {
-        const auto deadline = std::chrono::steady_clock::now() + std::chrono::seconds(20);
-        while (ends(activity) < count) {
-            if (std::chrono::steady_clock::now() > deadline) {
-                return false;
-            }
+        for (int i = 0; i < 4000 && ends(activity) < count; ++i) {
             std::this_thread::sleep_for(std::chrono::milliseconds(5));
         }
-        return true;
-    }
-    // The pending follow-ups as the settings application shows them, by title.
-    std::vector<Value> followUps() {
-        auto out = ctl({"followups", "--json"});
-        auto list = parseJson(out.out);
-        EXPECT_TRUE(list && list->isArray()) << out.out << out.err;
-        return list && list->isArray() ? *list->asArray() : std::vector<Value>{};
+        return ends(activity) >= count;
     }
     std::optional<Date> target(const std::string& activity) {
         return FilePreferenceStore(FilePreferenceStore::domainPath(agent.home()))
@@ -142,27 +131,25 @@ class OfferRoadTest : public ::testing::Test {
             registry ? registry->find("com.velmora.qaxagent." + activity) : nullptr;
         return entry && entry->find("DueDate");
     }
-    // One line of `followups --json` in short: "title|days|badge|notification".
-    static std::string row(const Value& item) {
-        auto text = [&](const char* key) {
-            const Value* v = item.find(key);
-            return v && v->isString() ? *v->asString() : std::string("-");
-        };
-        const Value* days = item.find("remainingDays");
-        const Value* badge = item.find("badge");
-        const Value* note = item.find("notification");
-        const Value* noteText = note ? note->find("text") : nullptr;
-        return text("title") + "|" + (days ? days->description() : "-") + "|" +
-               (badge && badge->asBool() && *badge->asBool() ? "badge" : "-") + "|" +
-               (noteText && noteText->isString() ? *noteText->asString() : "-");
-    }
+    // The pending follow-ups as the settings application shows them, in short and sorted:
+    // "title|days|badge|notification".
     std::vector<std::string> rows() {
-        std::vector<std::string> out;
-        for (const auto& item : followUps()) {
-            out.push_back(row(item));
+        auto out = ctl({"followups", "--json"});
+        auto list = parseJson(out.out);
+        EXPECT_TRUE(list && list->isArray()) << out.out << out.err;
+        std::vector<std::string> rows;
+        for (const auto& item : list && list->isArray() ? *list->asArray() : Value::Array{}) {
+            auto text = [&](const Value* v) {
+                return v && v->isString() ? *v->asString() : std::string("-");
+            };
+            const Value* days = item.find("remainingDays");
+            const Value* note = item.find("notification");
+            rows.push_back(text(item.find("title")) + "|" + (days ? days->description() : "-") +
+                           "|" + (item.find("badge")->truthy() ? "badge" : "-") + "|" +
+                           text(note ? note->find("text") : nullptr));
         }
-        std::sort(out.begin(), out.end());
-        return out;
+        std::sort(rows.begin(), rows.end());
+        return rows;
     }
 
     // Sets coverage-sim's scenario (a JSON object), or clears it without one.
@@ -207,8 +194,15 @@ TEST_F(OfferRoadTest, FortyDaysOfAnOffer) {
     EXPECT_EQ(target("followuppost"), day(10));
     EXPECT_TRUE(rows().empty());
 
-    // Day 10: the post puts the item up, counts it once and starts the refresh chain.
+    // Day 10: the clock change reaches the agent at once; the post puts the item up, counts it
+    // once and starts the refresh chain.
+    const auto advanced = std::chrono::steady_clock::now();
     advance("10d");
+    ASSERT_TRUE(waitFor("Firing activity 'com.velmora.qaxagent.followuppost'")) << agent.log();
+    const double latency =
+        std::chrono::duration<double>(std::chrono::steady_clock::now() - advanced).count();
+    std::printf("qaxctl clock advance to the post's fire: %.3f s\n", latency);
+    EXPECT_LT(latency, 1.0);
     ASSERT_TRUE(waitForEnds("followuppost", 1)) << agent.log();
     EXPECT_EQ(rows(), std::vector<std::string>{"Add the Haverly plan|30|-|-"});
     EXPECT_EQ(target("followuprefresh"), day(11));
