@@ -124,50 +124,6 @@ TEST_F(AgentServiceTest, EntitledClientsAreServedAndOthersClosed) {
     EXPECT_EQ(defaultSerial(*client), "ITEST-SN-1") << "the first client is still served";
 }
 
-TEST_F(AgentServiceTest, QaxctlShowsTheDevicesAndTheOverride) {
-    agent.registerApplication("settings", std::filesystem::canonical(QAX_CTL_BINARY).string(),
-                              "com.velmora.Preferences", Value(true));
-    Value::Dictionary watch{{"name", Value("Morning")},    {"localizedModel", Value("Watch")},
-                            {"serialNumber", Value("W1")}, {"pairedDate", Value(Date(1.7e9))},
-                            {"isPaired", Value(true)},     {"isArchived", Value(false)}};
-    Value::Dictionary archived = watch;
-    archived["serialNumber"] = "W0";
-    archived["isArchived"] = true;
-    agent.writeRootFile("paired-devices.plist", Value(Value::Array{Value(watch), Value(archived)}));
-    agent.writeRootFile("features.plist",
-                        Value(Value::Dictionary{
-                            {"Kestova", Value(Value::Dictionary{{"Tessel_3_0", Value(true)}})}}));
-    FilePreferenceStore(FilePreferenceStore::domainPath(agent.home()))
-        .setObject("ServerVersionOverride",
-                   Value(Value::Dictionary{{"LowServerVersion", Value(2)},
-                                           {"HighServerVersion", Value(3)}}));
-
-    auto device = ctl({"default-device", "--json"});
-    ASSERT_EQ(device.status, 0) << device.err;
-    auto json = parseJson(device.out);
-    ASSERT_TRUE(json) << device.out;
-    EXPECT_EQ(*json->find("serialNumber"), Value("ITEST-SN-1"));
-    EXPECT_EQ(*json->find("deviceTypeString"), Value("Default"));
-    EXPECT_TRUE(agent.waitForLog("with calling process: com.velmora.Preferences"));
-    auto paired = ctl({"paired-devices", "--json"});
-    ASSERT_EQ(paired.status, 0) << paired.err;
-    auto list = parseJson(paired.out);
-    ASSERT_TRUE(list && list->isArray() && list->size() == 1) << paired.out;
-    EXPECT_EQ(*(*list->asArray())[0].find("serialNumber"), Value("W1"));
-    EXPECT_EQ(*(*list->asArray())[0].find("name"), Value("Morning"));
-    EXPECT_NE(ctl({"paired-devices"}).out.find("Morning  W1"), std::string::npos);
-
-    // An internal build reads the web URL override.
-    auto plain = ctl({"web-url-override"});
-    EXPECT_EQ(plain.status, 0) << plain.err;
-    EXPECT_EQ(plain.out, "no web URL override\n");
-    FilePreferenceStore(FilePreferenceStore::domainPath(agent.home()))
-        .setObject("WebFlowURL", Value("https://flow.example/x"));
-    auto stored = ctl({"web-url-override", "--json"});
-    EXPECT_EQ(stored.status, 0) << stored.err;
-    EXPECT_EQ(stored.out, "\"https://flow.example/x\"\n");
-}
-
 TEST_F(AgentServiceTest, BrokenFramesAndBadRequestsHarmOnlyTheirSender) {
     auto bytes = [](std::initializer_list<unsigned char> b) {
         return std::string(b.begin(), b.end());
@@ -238,7 +194,49 @@ TEST_F(AgentServiceTest, BrokenFramesAndBadRequestsHarmOnlyTheirSender) {
     EXPECT_TRUE(agent.running());
 }
 
-TEST_F(AgentServiceTest, LaunchEventsASecondAgentAndACleanStop) {
+TEST_F(AgentServiceTest, QaxctlLaunchEventsASecondAgentAndACleanStop) {
+    agent.registerApplication("settings", std::filesystem::canonical(QAX_CTL_BINARY).string(),
+                              "com.velmora.Preferences", Value(true));
+    Value::Dictionary watch{{"name", Value("Morning")},    {"localizedModel", Value("Watch")},
+                            {"serialNumber", Value("W1")}, {"pairedDate", Value(Date(1.7e9))},
+                            {"isPaired", Value(true)},     {"isArchived", Value(false)}};
+    Value::Dictionary archived = watch;
+    archived["serialNumber"] = "W0";
+    archived["isArchived"] = true;
+    agent.writeRootFile("paired-devices.plist", Value(Value::Array{Value(watch), Value(archived)}));
+    agent.writeRootFile("features.plist",
+                        Value(Value::Dictionary{
+                            {"Kestova", Value(Value::Dictionary{{"Tessel_3_0", Value(true)}})}}));
+    FilePreferenceStore(FilePreferenceStore::domainPath(agent.home()))
+        .setObject("ServerVersionOverride",
+                   Value(Value::Dictionary{{"LowServerVersion", Value(2)},
+                                           {"HighServerVersion", Value(3)}}));
+
+    auto device = ctl({"default-device", "--json"});
+    ASSERT_EQ(device.status, 0) << device.err;
+    auto json = parseJson(device.out);
+    ASSERT_TRUE(json) << device.out;
+    EXPECT_EQ(*json->find("serialNumber"), Value("ITEST-SN-1"));
+    EXPECT_EQ(*json->find("deviceTypeString"), Value("Default"));
+    EXPECT_TRUE(agent.waitForLog("with calling process: com.velmora.Preferences"));
+    auto paired = ctl({"paired-devices", "--json"});
+    ASSERT_EQ(paired.status, 0) << paired.err;
+    auto list = parseJson(paired.out);
+    ASSERT_TRUE(list && list->isArray() && list->size() == 1) << paired.out;
+    EXPECT_EQ(*(*list->asArray())[0].find("serialNumber"), Value("W1"));
+    EXPECT_EQ(*(*list->asArray())[0].find("name"), Value("Morning"));
+    EXPECT_NE(ctl({"paired-devices"}).out.find("Morning  W1"), std::string::npos);
+
+    // An internal build reads the web URL override.
+    auto plain = ctl({"web-url-override"});
+    EXPECT_EQ(plain.status, 0) << plain.err;
+    EXPECT_EQ(plain.out, "no web URL override\n");
+    FilePreferenceStore(FilePreferenceStore::domainPath(agent.home()))
+        .setObject("WebFlowURL", Value("https://flow.example/x"));
+    auto stored = ctl({"web-url-override", "--json"});
+    EXPECT_EQ(stored.status, 0) << stored.err;
+    EXPECT_EQ(stored.out, "\"https://flow.example/x\"\n");
+
     ASSERT_TRUE(HostNotificationSocket::post(agent.runtimeDirectory(),
                                              "com.velmora.pairlink.devicedidunpair"));
     EXPECT_TRUE(agent.waitForLog(

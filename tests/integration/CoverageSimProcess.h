@@ -3,6 +3,7 @@
 // stopped with SIGTERM when the object goes. Also reads its request log.
 #pragma once
 
+#include <memory>
 #include <string>
 #include <vector>
 
@@ -17,7 +18,7 @@ class CoverageSimProcess {
     CoverageSimProcess(const std::string& state, const std::string& platformRoot,
                        const std::vector<std::string>& extraArgs = {},
                        const std::vector<std::string>& environment = {});
-    ~CoverageSimProcess() { process_.stop(); }
+    ~CoverageSimProcess() { process_->stop(); }
 
     // "https://127.0.0.1:PORT"; empty when the simulator did not start.
     const std::string& base() const { return base_; }
@@ -27,11 +28,8 @@ class CoverageSimProcess {
     std::vector<Value> requestLog() const;
 
   private:
-    static std::string prepare(const std::string& state);
-    static std::vector<std::string> withEnviron(std::vector<std::string> environment);
-
     std::string state_;
-    SpawnedProcess process_;
+    std::unique_ptr<SpawnedProcess> process_;
     std::string base_;
 };
 

@@ -89,7 +89,7 @@ TEST(OnDemandStartTest, IdleExitAndTheNextInstanceKeepStateAndALateClient) {
         HostIpcClient client;
         EXPECT_EQ(defaultSerial(client), "OD-1") << agent.log();
         EXPECT_EQ(receiveNotice(notices), "READY=1\nSTATUS=Serving clients");
-        std::this_thread::sleep_for(std::chrono::milliseconds(2000));
+        std::this_thread::sleep_for(std::chrono::milliseconds(1500));
         EXPECT_TRUE(first->running()) << "a connected client keeps the agent past its idle time";
         auto written = test::runTool(QAX_CTL_BINARY,
                                      {"defaults", "write", "SerialNumber", "-string", "OD-KEPT"},
