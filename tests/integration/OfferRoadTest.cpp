@@ -119,18 +119,22 @@ class OfferRoadTest : public ::testing::Test {
         }
         return ends(activity) >= count;
     }
-    std::optional<Date> target(const std::string& activity) {
-        return FilePreferenceStore(FilePreferenceStore::domainPath(agent.home()))
-            .dateForKey("com.velmora.qaxagent." + activity + ".TargetDate");
+    // The activities as `qaxctl activities` shows them, by name without the prefix.
+    std::map<std::string, Value> activities() {
+        std::map<std::string, Value> byName;
+        auto list = parseJson(ctl({"activities", "--json"}).out);
+        for (const auto& a : list && list->isArray() ? *list->asArray() : Value::Array{}) {
+            byName[a.find("identifier")->asString()->substr(sizeof "com.velmora.qaxagent")] = a;
+        }
+        return byName;
     }
-    bool registered(const std::string& activity) {
-        auto text =
-            test::readFile(std::filesystem::path(agent.platformRoot()) / "state/activities.plist");
-        auto registry = parsePlist(text);
-        const Value* entry =
-            registry ? registry->find("com.velmora.qaxagent." + activity) : nullptr;
-        return entry && entry->find("DueDate");
+    Value activity(const std::string& name) { return activities()[name]; }
+    std::optional<Date> target(const std::string& name) {
+        const Value a = activity(name);
+        const Value* date = a.find("targetDate");
+        return date && date->isString() ? Date::parseIso8601(*date->asString()) : std::nullopt;
     }
+    bool registered(const std::string& name) { return activity(name).find("registration"); }
     // The pending follow-ups as the settings application shows them, in short and sorted:
     // "title|days|badge|notification".
     std::vector<std::string> rows() {
@@ -193,6 +197,25 @@ TEST_F(OfferRoadTest, FortyDaysOfAnOffer) {
         "post upgrade activity hasn't yet been performed, perform upgrade activity"));
     EXPECT_EQ(target("followuppost"), day(10));
     EXPECT_TRUE(rows().empty());
+    // qaxctl activities shows the shipped launch configuration beside the agent's state.
+    const std::tuple<const char*, const char*, bool> launch[] = {
+        {"upgrade", "upgrade", false},
+        {"boot", "boot", false},
+        {"outreach", "interval", true},
+        {"followuppost", "interval", true},
+        {"conversionoutreach", "interval", true},
+        {"followuprefresh", "interval", false},
+    };
+    auto listed = activities();
+    EXPECT_EQ(listed.size(), std::size(launch));
+    for (const auto& [name, trigger, network] : launch) {
+        const Value& a = listed[name];
+        EXPECT_EQ(a.find("trigger") ? *a.find("trigger") : Value(), Value(trigger)) << name;
+        EXPECT_EQ(a.find("requiresNetwork") ? *a.find("requiresNetwork") : Value(), Value(network))
+            << name;
+    }
+    EXPECT_EQ(listed["outreach"].find("lastResult")->description(), "1");
+    EXPECT_NE(ctl({"activities"}).out.find("registration  due"), std::string::npos);
 
     // Day 10: the clock change reaches the agent at once; the post puts the item up, counts it
     // once and starts the refresh chain.

@@ -1,4 +1,4 @@
-// qaxctl clock, defer, activities and followups run as real processes against a temporary
+// qaxctl clock, defer and followups run as real processes against a temporary
 // platform root with the shipped launch configuration; the shipped interface strings.
 #include <gtest/gtest.h>
 
@@ -8,8 +8,6 @@
 #include "AgentProcess.h"
 #include "core/JsonCodec.h"
 #include "fakes/FakeServices.h"
-#include "platform/host/FilePreferenceStore.h"
-#include "platform/host/HostActivityRegistry.h"
 #include "platform/host/HostFollowUpCenter.h"
 #include "platform/host/HostUserInterfaceStrings.h"
 #include "platform/host/SystemClock.h"
@@ -75,62 +73,6 @@ TEST_F(QaxctlHostState, ClockAndDefer) {
     ASSERT_EQ(qaxctl({"defer", "off"}).status, 0);
     EXPECT_FALSE(fs::exists(deferFile));
     EXPECT_EQ(qaxctl({"defer", "maybe"}).status, 64);
-}
-
-TEST_F(QaxctlHostState, ActivitiesFromTheLaunchConfigurationRegistryAndPreferences) {
-    const Date now = SystemClock().now();
-    HostActivityRegistry::Records records;
-    ActivityRecord& outreach = records["com.velmora.qaxagent.outreach"];
-    outreach.delay = 3600;
-    outreach.gracePeriod = 360;
-    outreach.requiresNetwork = true;
-    outreach.scheduledAt = now;
-    outreach.dueDate = now.byAdding(3600);
-    outreach.lastFired = now.byAdding(-600);
-    outreach.lastResult = 2;
-    outreach.deferrals = 1;
-    ASSERT_TRUE(HostActivityRegistry::save(r.platformRoot(), records, nullptr));
-    FilePreferenceStore(FilePreferenceStore::domainPath(r.home()))
-        .setObject("com.velmora.qaxagent.outreach.TargetDate", Value(now.byAdding(3600)));
-
-    std::map<std::string, Value> byId;
-    auto list = json({"activities", "--json"});
-    ASSERT_TRUE(list.isArray());
-    for (const auto& a : *list.asArray()) {
-        byId[*a.find("identifier")->asString()] = a;
-    }
-    struct Row {
-        const char* identifier;
-        const char* trigger;
-        bool network;
-    } rows[] = {
-        {"com.velmora.qaxagent.upgrade", "upgrade", false},
-        {"com.velmora.qaxagent.boot", "boot", false},
-        {"com.velmora.qaxagent.outreach", "interval", true},
-        {"com.velmora.qaxagent.followuppost", "interval", true},
-        {"com.velmora.qaxagent.conversionoutreach", "interval", true},
-        {"com.velmora.qaxagent.followuprefresh", "interval", false},
-    };
-    ASSERT_EQ(byId.size(), std::size(rows));
-    for (const auto& row : rows) {
-        SCOPED_TRACE(row.identifier);
-        const Value& a = byId[row.identifier];
-        EXPECT_EQ(*a.find("trigger"), Value(row.trigger));
-        EXPECT_EQ(*a.find("requiresNetwork"), Value(row.network));
-        EXPECT_EQ(*a.find("interval"), Value(0));
-    }
-    const Value& o = byId["com.velmora.qaxagent.outreach"];
-    ASSERT_TRUE(o.find("registration"));
-    EXPECT_EQ(*o.find("registration")->find("dueDate"), Value(now.byAdding(3600).iso8601()));
-    EXPECT_EQ(*o.find("registration")->find("due"), Value(false));
-    // The preference domain is XML: its dates keep whole seconds.
-    EXPECT_NEAR(Date::parseIso8601(*o.find("targetDate")->asString())->timeIntervalSince(now), 3600,
-                1);
-    EXPECT_EQ(*o.find("lastResult"), Value(2));
-    EXPECT_FALSE(byId["com.velmora.qaxagent.boot"].find("registration"));
-
-    auto text = qaxctl({"activities"});
-    EXPECT_NE(text.out.find("due "), std::string::npos) << text.out;
 }
 
 TEST_F(QaxctlHostState, FollowUpsAsTheSettingsApplicationWouldShowThem) {
