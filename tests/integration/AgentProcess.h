@@ -5,10 +5,12 @@
 
 #include <sys/types.h>
 
+#include <memory>
 #include <optional>
 #include <string>
 #include <vector>
 
+#include "SpawnedProcess.h"
 #include "core/Value.h"
 #include "fakes/TestPlatform.h"
 
@@ -17,12 +19,13 @@ namespace qax::test {
 class AgentProcess {
   public:
     AgentProcess();
-    ~AgentProcess();
+    ~AgentProcess() { stop(); }
 
-    std::string home() const;
-    std::string platformRoot() const;
-    std::string runtimeDirectory() const;
-    std::string socketPath() const;
+    std::string home() const { return dir_.str(); }
+    std::string platformRoot() const { return dir_.str() + "/root"; }
+    std::string runtimeDirectory() const { return dir_.str() + "/run"; }
+    std::string socketPath() const { return runtimeDirectory() + "/com.velmora.qaxagent"; }
+    std::string logPath() const { return dir_.str() + "/agent.log"; }
 
     // Writes a file under the platform root ("device.plist", "apps/x.plist").
     void writeRootFile(const std::string& relativePath, const Value& plist);
@@ -32,15 +35,16 @@ class AgentProcess {
                              std::optional<std::string> bundleIdentifier,
                              std::optional<Value> entitlement);
 
-    // Starts the agent and waits until it listens; false (with the log) when it does not.
-    bool start();
+    // Starts the agent (or another build of it) on a fresh log and waits until it listens;
+    // false when it does not.
+    bool start(const std::string& program = QAX_AGENT_BINARY);
     // Sends `signal` and waits for the exit; the raw wait status, or -1 if it had to be killed.
     int stop(int signal = 15);
-    bool running();
-    pid_t pid() const { return pid_; }
+    bool running() { return process_ && process_->running(); }
+    pid_t pid() const { return process_ ? process_->pid() : -1; }
 
     // The agent's stderr so far.
-    std::string log() const;
+    std::string log() const { return readFile(logPath()); }
     int countInLog(const std::string& text) const;
     // Polls the log until `text` has appeared `times` times.
     bool waitForLog(const std::string& text, int times = 1, double seconds = 5) const;
@@ -53,11 +57,11 @@ class AgentProcess {
 
   private:
     TempDir dir_;
-    pid_t pid_ = -1;
+    std::unique_ptr<SpawnedProcess> process_;
 };
 
 struct ToolResult {
-    int status = -1;
+    int status = -1;  // the exit status; -1 when killed by a signal or at the deadline
     std::string out;
     std::string err;
 };

@@ -1,5 +1,5 @@
-// The running agent over its real socket: who gets served, what a request gets back, what
-// hostile or broken clients do to the others, launch events, and a clean stop.
+// The running agent over its real socket: who gets served, what a request and qaxctl get back,
+// what hostile or broken clients do to the others, launch events, and a clean stop.
 #include <gtest/gtest.h>
 
 #include <signal.h>
@@ -30,7 +30,8 @@ class AgentServiceTest : public ::testing::Test {
         agent.writeRootFile("device.plist",
                             Value(Value::Dictionary{{"SerialNumber", Value("ITEST-SN-1")},
                                                     {"ProductType", Value("Phone1,1")},
-                                                    {"ProductVersion", Value("1.0")}}));
+                                                    {"ProductVersion", Value("1.0")},
+                                                    {"InternalBuild", Value(true)}}));
         // This test process is the entitled client; it is registered outside any bundle.
         entitle(Value(true));
         ASSERT_TRUE(agent.start()) << agent.log();
@@ -51,23 +52,22 @@ class AgentServiceTest : public ::testing::Test {
     std::optional<std::string> defaultSerial(HostIpcClient& client) {
         std::string error;
         auto reply = client.call("defaultDevice:", {}, kWait, &error);
-        if (!reply || !reply->value) {
-            return std::nullopt;
-        }
-        auto device = QAXDevice::decode(*reply->value);
+        auto device = reply && reply->value ? QAXDevice::decode(*reply->value) : nullptr;
         return device ? device->serialNumber() : std::nullopt;
+    }
+
+    test::ToolResult ctl(const std::vector<std::string>& args) {
+        return test::runTool(QAX_CTL_BINARY, args, agent.environment());
     }
 
     test::AgentProcess agent;
 };
 
-TEST_F(AgentServiceTest, EntitledClientGetsTheDefaultDevice) {
+TEST_F(AgentServiceTest, EntitledClientsAreServedAndOthersClosed) {
     auto client = connect();
     std::string error;
     auto reply = client->call("defaultDevice:", {}, kWait, &error);
-    ASSERT_TRUE(reply) << error;
-    ASSERT_FALSE(reply->error) << *reply->error;
-    ASSERT_TRUE(reply->value);
+    ASSERT_TRUE(reply && reply->value) << error;
     auto device = QAXDevice::decode(*reply->value);
     ASSERT_NE(device, nullptr) << reply->value->description();
     EXPECT_EQ(device->name(), "Default Device");
@@ -75,29 +75,30 @@ TEST_F(AgentServiceTest, EntitledClientGetsTheDefaultDevice) {
     EXPECT_EQ(device->deviceType(), QAXDeviceTypeDefault);
     EXPECT_TRUE(agent.waitForLog("connection added from " + std::to_string(getpid()) +
                                  " with calling process: (null)"));
-}
 
-TEST_F(AgentServiceTest, DeviceInfosAndDismissalsAreServed) {
-    auto client = connect();
-    std::string error;
-    // Cached only: nothing is cached, so the one device comes back without a warranty.
+    // Cached only: nothing is cached, so the one device comes back without a warranty, and the
+    // log names no serial number by default.
     auto all = client->call("getAllDeviceInfosUsingPolicy:updateFollowUps:withReply:",
                             {Value(1), Value(true)}, kWait, &error);
-    ASSERT_TRUE(all && all->value && all->value->isArray()) << error;
-    ASSERT_EQ(all->value->size(), 1u);
+    ASSERT_TRUE(all && all->value && all->value->size() == 1) << error;
     const Value& info = (*all->value->asArray())[0];
     EXPECT_EQ(*info.find("$class"), Value("QAXDeviceInfo"));
     EXPECT_EQ(*info.find("device")->find("serialNumber"), Value("ITEST-SN-1"));
     EXPECT_FALSE(info.find("warranty"));
-
+    EXPECT_TRUE(agent.waitForLog("getWarrantyUsingPolicy completionBlock <private> : 0"));
     auto dismissed = client->call(
         "dismissFollowUpForSerialNumber:completion:", {Value("ITEST-SN-1")}, kWait, &error);
     ASSERT_TRUE(dismissed) << error;
     EXPECT_EQ(dismissed->value, Value(true));
-    EXPECT_TRUE(agent.running());
-}
 
-TEST_F(AgentServiceTest, ClientsWithoutTheEntitlementAreClosed) {
+    // A second client at once gets its own agent (both fall back to the settings name).
+    auto second = connect();
+    EXPECT_EQ(defaultSerial(*second), "ITEST-SN-1");
+    EXPECT_TRUE(agent.waitForLog("callingProcessBundleID is nil. Falling back to Preferences", 2));
+    EXPECT_EQ(agent.countInLog("connection added from"), 2);
+    second.reset();
+    EXPECT_EQ(defaultSerial(*client), "ITEST-SN-1");
+
     const std::pair<const char*, std::optional<Value>> refused[] = {
         {"no entitlement", std::nullopt},
         {"the string YES", Value("YES")},
@@ -107,53 +108,29 @@ TEST_F(AgentServiceTest, ClientsWithoutTheEntitlementAreClosed) {
     int rejections = 0;
     for (const auto& [what, value] : refused) {
         entitle(value);
-        auto client = connect();
-        std::string error;
-        client->sendRequest(1, "defaultDevice:", {}, &error);
-        EXPECT_TRUE(client->waitForClose(kWait)) << what;
+        auto bad = connect();
+        bad->sendRequest(1, "defaultDevice:", {}, &error);
+        EXPECT_TRUE(bad->waitForClose(kWait)) << what;
         EXPECT_TRUE(agent.waitForLog(kRejected, ++rejections)) << what << "\n" << agent.log();
     }
     // A program the registry does not know at all.
-    auto ctl = test::runTool(QAX_CTL_BINARY, {"default-device"}, agent.environment());
-    EXPECT_EQ(ctl.status, 69) << ctl.err;
+    auto unknown = ctl({"store-check", "com.velmora.support"});
+    EXPECT_EQ(unknown.status, 69);
+    EXPECT_NE(unknown.err.find("the agent closed the connection"), std::string::npos)
+        << unknown.err;
     EXPECT_TRUE(agent.waitForLog(kRejected, ++rejections));
-
     entitle(Value(1));
-    auto client = connect();
-    EXPECT_EQ(defaultSerial(*client), "ITEST-SN-1");
-    EXPECT_TRUE(agent.running());
+    EXPECT_EQ(defaultSerial(*connect()), "ITEST-SN-1");
+    EXPECT_EQ(defaultSerial(*client), "ITEST-SN-1") << "the first client is still served";
 }
 
-TEST_F(AgentServiceTest, TwoClientsAtOnceEachGetTheirOwnAgent) {
-    auto a = connect();
-    auto b = connect();
-    std::string error;
-    ASSERT_TRUE(a->sendRequest(7, "defaultDevice:", {}, &error)) << error;
-    ASSERT_TRUE(b->sendRequest(7, "defaultDevice:", {}, &error)) << error;
-    for (auto* client : {a.get(), b.get()}) {
-        auto message = client->receive(kWait, &error);
-        ASSERT_TRUE(message) << error;
-        EXPECT_EQ(message->find("id")->asInteger(), 7);
-        EXPECT_TRUE(message->find("reply"));
-    }
-    // Each connection made its agent (both fell back to the settings application's name).
-    EXPECT_TRUE(agent.waitForLog("callingProcessBundleID is nil. Falling back to Preferences", 2));
-    EXPECT_EQ(agent.countInLog("connection added from"), 2);
-
-    a.reset();
-    EXPECT_EQ(defaultSerial(*b), "ITEST-SN-1");
-}
-
-TEST_F(AgentServiceTest, BrokenFramesCloseOnlyTheirOwnConnection) {
+TEST_F(AgentServiceTest, BrokenFramesAndBadRequestsHarmOnlyTheirSender) {
     auto bytes = [](std::initializer_list<unsigned char> b) {
         return std::string(b.begin(), b.end());
     };
     std::string deep;
     for (int i = 0; i < 200; ++i) {
-        deep += "<array>";
-    }
-    for (int i = 0; i < 200; ++i) {
-        deep += "</array>";
+        deep = "<array>" + deep + "</array>";
     }
     deep = "<?xml version=\"1.0\" encoding=\"UTF-8\"?><plist version=\"1.0\">" + deep + "</plist>";
     const std::pair<const char*, std::string> broken[] = {
@@ -165,7 +142,7 @@ TEST_F(AgentServiceTest, BrokenFramesCloseOnlyTheirOwnConnection) {
          *IpcFrameCodec::encode(Value(Value::Dictionary{{"op", Value("defaultDevice:")}}))},
         {"not a dictionary", *IpcFrameCodec::encode(Value(Value::Array{Value(1)}))},
     };
-    auto bystander = connect();
+    auto client = connect();
     int closures = 0;
     for (const auto& [what, frame] : broken) {
         auto bad = connect();
@@ -173,43 +150,30 @@ TEST_F(AgentServiceTest, BrokenFramesCloseOnlyTheirOwnConnection) {
         ASSERT_TRUE(bad->sendRaw(frame, &error)) << what << ": " << error;
         EXPECT_TRUE(bad->waitForClose(kWait)) << what;
         EXPECT_TRUE(agent.waitForLog("Closing connection from pid", ++closures)) << what;
-        EXPECT_EQ(defaultSerial(*bystander), "ITEST-SN-1") << "after " << what;
+        EXPECT_EQ(defaultSerial(*client), "ITEST-SN-1") << "after " << what;
     }
-    EXPECT_TRUE(agent.running());
-}
 
-TEST_F(AgentServiceTest, ErrorRepliesLeaveTheConnectionOpen) {
-    auto client = connect();
-    const std::tuple<const char*, Value::Array, const char*> cases[] = {
+    // Error replies leave the connection open.
+    const std::tuple<const char*, Value::Array, const char*> errors[] = {
         {"noSuchOperation:", {}, "unknown operation 'noSuchOperation:'"},
         {"defaultDevice:", {Value(1)}, "wrong arguments"},
         {"getDeviceInfoForSerialNumber:usingPolicy:withReply:",
          {Value(""), Value(0)},
          "wrong arguments"},
     };
-    for (const auto& [op, args, error] : cases) {
+    for (const auto& [op, args, text] : errors) {
         std::string transport;
         auto reply = client->call(op, args, kWait, &transport);
-        ASSERT_TRUE(reply) << op << ": " << transport;
-        ASSERT_TRUE(reply->error) << op;
-        EXPECT_EQ(reply->error->rfind(error, 0), 0u) << *reply->error;
+        ASSERT_TRUE(reply && reply->error) << op << ": " << transport;
+        EXPECT_EQ(reply->error->rfind(text, 0), 0u) << *reply->error;
     }
-    // An XML request on the same connection is served as well.
-    std::string error;
-    auto xml = toXmlPlist(Value(Value::Dictionary{
-        {"id", Value(99)}, {"op", Value("defaultDevice:")}, {"args", Value(Value::Array{})}}));
-    ASSERT_TRUE(client->sendRaw(*IpcFrameCodec::frame(*xml), &error)) << error;
-    auto message = client->receive(kWait, &error);
-    ASSERT_TRUE(message) << error;
-    EXPECT_EQ(message->find("id")->asInteger(), 99);
-    EXPECT_EQ(defaultSerial(*client), "ITEST-SN-1");
-}
 
-TEST_F(AgentServiceTest, ManyOutstandingRequestsOnOneConnection) {
-    auto client = connect();
-    constexpr int kRequests = 300;  // well past what the agent keeps in flight at once
-    std::string all;
-    for (int id = 1; id <= kRequests; ++id) {
+    // Far more requests at once than the agent keeps in flight, one of them in XML: each is
+    // answered once.
+    constexpr int kRequests = 300;
+    std::string all = *IpcFrameCodec::frame(*toXmlPlist(Value(Value::Dictionary{
+        {"id", Value(kRequests)}, {"op", Value("defaultDevice:")}, {"args", Value::Array{}}})));
+    for (int id = 1; id < kRequests; ++id) {
         all += *IpcFrameCodec::encode(
             Value(Value::Dictionary{{"id", Value(id)},
                                     {"op", Value(id % 2 ? "defaultDevice:" : "pairedDevices:")},
@@ -227,52 +191,12 @@ TEST_F(AgentServiceTest, ManyOutstandingRequestsOnOneConnection) {
     EXPECT_EQ(ids.size(), static_cast<std::size_t>(kRequests));
     EXPECT_EQ(*ids.begin(), 1);
     EXPECT_EQ(*ids.rbegin(), kRequests);
+    EXPECT_TRUE(agent.running());
 }
 
-TEST_F(AgentServiceTest, LaunchEventsReachTheHandler) {
-    ASSERT_TRUE(HostNotificationSocket::post(agent.runtimeDirectory(),
-                                             "com.velmora.pairlink.devicedidunpair"));
-    EXPECT_TRUE(agent.waitForLog(
-        "got launched with notificationName: com.velmora.pairlink.devicedidunpair"));
-    EXPECT_EQ(agent.countInLog("entered stream for test"), 1);
-
-    auto ctl = test::runTool(QAX_CTL_BINARY, {"notify", "com.velmora.pairlink.devicedidpair"},
-                             agent.environment());
-    EXPECT_EQ(ctl.status, 0) << ctl.err;
-    EXPECT_TRUE(
-        agent.waitForLog("got launched with notificationName: com.velmora.pairlink.devicedidpair"));
-    EXPECT_EQ(agent.countInLog("entered stream for test"), 2);
-}
-
-TEST_F(AgentServiceTest, SecondAgentRefusesAndSignalsStopCleanly) {
-    test::AgentProcess second;
-    auto twin = test::runTool(QAX_AGENT_BINARY, {}, agent.environment(), 10);
-    EXPECT_EQ(twin.status, 1) << "a second agent on the same socket must not start";
-    EXPECT_NE(twin.err.find("another process serves"), std::string::npos) << twin.err;
-
-    auto client = connect();
-    EXPECT_EQ(defaultSerial(*client), "ITEST-SN-1") << "the first agent is undisturbed";
-
-    const int status = agent.stop(SIGTERM);
-    ASSERT_NE(status, -1) << "did not stop on SIGTERM";
-    EXPECT_TRUE(WIFEXITED(status) && WEXITSTATUS(status) == 0) << status;
-    struct stat st {};
-    EXPECT_NE(::stat(agent.socketPath().c_str(), &st), 0) << "socket file left behind";
-    EXPECT_NE(::stat((agent.runtimeDirectory() + "/notify").c_str(), &st), 0);
-    EXPECT_TRUE(client->waitForClose(kWait));
-
-    // SIGINT the same way, and the agent starts again on the same directory.
-    ASSERT_TRUE(agent.start()) << agent.log();
-    const int interrupted = agent.stop(SIGINT);
-    EXPECT_TRUE(WIFEXITED(interrupted) && WEXITSTATUS(interrupted) == 0) << interrupted;
-}
-
-TEST_F(AgentServiceTest, QaxctlShowsTheDevices) {
+TEST_F(AgentServiceTest, QaxctlLaunchEventsASecondAgentAndACleanStop) {
     agent.registerApplication("settings", std::filesystem::canonical(QAX_CTL_BINARY).string(),
                               "com.velmora.Preferences", Value(true));
-    agent.writeRootFile("features.plist",
-                        Value(Value::Dictionary{
-                            {"Kestova", Value(Value::Dictionary{{"Tessel_3_0", Value(true)}})}}));
     Value::Dictionary watch{{"name", Value("Morning")},    {"localizedModel", Value("Watch")},
                             {"serialNumber", Value("W1")}, {"pairedDate", Value(Date(1.7e9))},
                             {"isPaired", Value(true)},     {"isArchived", Value(false)}};
@@ -280,30 +204,71 @@ TEST_F(AgentServiceTest, QaxctlShowsTheDevices) {
     archived["serialNumber"] = "W0";
     archived["isArchived"] = true;
     agent.writeRootFile("paired-devices.plist", Value(Value::Array{Value(watch), Value(archived)}));
+    agent.writeRootFile("features.plist",
+                        Value(Value::Dictionary{
+                            {"Kestova", Value(Value::Dictionary{{"Tessel_3_0", Value(true)}})}}));
     FilePreferenceStore(FilePreferenceStore::domainPath(agent.home()))
         .setObject("ServerVersionOverride",
                    Value(Value::Dictionary{{"LowServerVersion", Value(2)},
                                            {"HighServerVersion", Value(3)}}));
 
-    auto device = test::runTool(QAX_CTL_BINARY, {"default-device", "--json"}, agent.environment());
+    auto device = ctl({"default-device", "--json"});
     ASSERT_EQ(device.status, 0) << device.err;
     auto json = parseJson(device.out);
     ASSERT_TRUE(json) << device.out;
     EXPECT_EQ(*json->find("serialNumber"), Value("ITEST-SN-1"));
     EXPECT_EQ(*json->find("deviceTypeString"), Value("Default"));
     EXPECT_TRUE(agent.waitForLog("with calling process: com.velmora.Preferences"));
-
-    auto paired = test::runTool(QAX_CTL_BINARY, {"paired-devices", "--json"}, agent.environment());
+    auto paired = ctl({"paired-devices", "--json"});
     ASSERT_EQ(paired.status, 0) << paired.err;
     auto list = parseJson(paired.out);
-    ASSERT_TRUE(list && list->isArray()) << paired.out;
-    ASSERT_EQ(list->size(), 1u) << paired.out;
+    ASSERT_TRUE(list && list->isArray() && list->size() == 1) << paired.out;
     EXPECT_EQ(*(*list->asArray())[0].find("serialNumber"), Value("W1"));
     EXPECT_EQ(*(*list->asArray())[0].find("name"), Value("Morning"));
+    EXPECT_NE(ctl({"paired-devices"}).out.find("Morning  W1"), std::string::npos);
 
-    auto table = test::runTool(QAX_CTL_BINARY, {"paired-devices"}, agent.environment());
-    EXPECT_EQ(table.status, 0);
-    EXPECT_NE(table.out.find("Morning  W1"), std::string::npos) << table.out;
+    // An internal build reads the web URL override.
+    auto plain = ctl({"web-url-override"});
+    EXPECT_EQ(plain.status, 0) << plain.err;
+    EXPECT_EQ(plain.out, "no web URL override\n");
+    FilePreferenceStore(FilePreferenceStore::domainPath(agent.home()))
+        .setObject("WebFlowURL", Value("https://flow.example/x"));
+    auto stored = ctl({"web-url-override", "--json"});
+    EXPECT_EQ(stored.status, 0) << stored.err;
+    EXPECT_EQ(stored.out, "\"https://flow.example/x\"\n");
+
+    ASSERT_TRUE(HostNotificationSocket::post(agent.runtimeDirectory(),
+                                             "com.velmora.pairlink.devicedidunpair"));
+    EXPECT_TRUE(agent.waitForLog(
+        "got launched with notificationName: com.velmora.pairlink.devicedidunpair"));
+    auto notified = ctl({"notify", "com.velmora.pairlink.devicedidpair"});
+    EXPECT_EQ(notified.status, 0) << notified.err;
+    EXPECT_TRUE(
+        agent.waitForLog("got launched with notificationName: com.velmora.pairlink.devicedidpair"));
+    EXPECT_EQ(agent.countInLog("entered stream for test"), 2);
+
+    // Others can neither reach the socket nor read the preferences the agent wrote on start.
+    struct stat st {};
+    ASSERT_EQ(::stat(agent.runtimeDirectory().c_str(), &st), 0);
+    EXPECT_EQ(st.st_mode & 077, 0u) << std::oct << st.st_mode;
+    ASSERT_EQ(::stat(FilePreferenceStore::domainPath(agent.home()).c_str(), &st), 0);
+    EXPECT_EQ(st.st_mode & 077, 0u) << std::oct << st.st_mode;
+
+    auto twin = test::runTool(QAX_AGENT_BINARY, {}, agent.environment(), 10);
+    EXPECT_EQ(twin.status, 1) << "a second agent on the same socket must not start";
+    EXPECT_NE(twin.err.find("another process serves"), std::string::npos) << twin.err;
+    auto client = connect();
+    EXPECT_EQ(defaultSerial(*client), "ITEST-SN-1") << "the first agent is undisturbed";
+
+    const int status = agent.stop(SIGTERM);
+    EXPECT_TRUE(WIFEXITED(status) && WEXITSTATUS(status) == 0) << status;
+    EXPECT_FALSE(std::filesystem::exists(agent.socketPath())) << "socket file left behind";
+    EXPECT_FALSE(std::filesystem::exists(agent.runtimeDirectory() + "/notify"));
+    EXPECT_TRUE(client->waitForClose(kWait));
+    // SIGINT the same way, and the agent starts again on the same directory.
+    ASSERT_TRUE(agent.start()) << agent.log();
+    const int interrupted = agent.stop(SIGINT);
+    EXPECT_TRUE(WIFEXITED(interrupted) && WEXITSTATUS(interrupted) == 0) << interrupted;
 }
 
 }  // namespace

@@ -1,8 +1,10 @@
 #include "CoverageSimProcess.h"
 
-#include <signal.h>
-#include <sys/wait.h>
 #include <unistd.h>
+
+#include <chrono>
+#include <filesystem>
+#include <thread>
 
 #include "core/AtomicFile.h"
 #include "core/JsonCodec.h"
@@ -13,56 +15,32 @@ CoverageSimProcess::CoverageSimProcess(const std::string& state, const std::stri
                                        const std::vector<std::string>& extraArgs,
                                        const std::vector<std::string>& environment)
     : state_(state) {
-    std::vector<std::string> args = {QAX_SIM_BINARY,
-                                     "--state",
+    std::vector<std::string> args = {"--state",
                                      state,
                                      "--platform-root",
                                      platformRoot,
                                      "--attestation-root",
                                      platformRoot + "/state/attestation/ca.pem"};
     args.insert(args.end(), extraArgs.begin(), extraArgs.end());
-    // Everything the child needs is built before the fork: only exec-safe calls after it.
     std::vector<std::string> env(environment);
     for (char** e = environ; *e; ++e) {
         env.push_back(*e);
     }
-    std::vector<char*> argv, envp;
-    for (auto& a : args) {
-        argv.push_back(a.data());
-    }
-    for (auto& e : env) {
-        envp.push_back(e.data());
-    }
-    argv.push_back(nullptr);
-    envp.push_back(nullptr);
-    int out[2];
-    if (pipe(out) != 0) {
-        return;
-    }
-    pid_ = fork();
-    if (pid_ == 0) {
-        dup2(out[1], STDOUT_FILENO);
-        close(out[0]);
-        execve(QAX_SIM_BINARY, argv.data(), envp.data());
-        _exit(127);
-    }
-    close(out[1]);
-    std::string line;
-    char c;
-    while (read(out[0], &c, 1) == 1 && c != '\n') {
-        line += c;
-    }
-    close(out[0]);
-    auto colon = line.rfind(':');
-    if (line.find("listening") != std::string::npos && colon != std::string::npos) {
-        base_ = "https://127.0.0.1:" + line.substr(colon + 1);
-    }
-}
-
-CoverageSimProcess::~CoverageSimProcess() {
-    if (pid_ > 0) {
-        kill(pid_, SIGTERM);
-        waitpid(pid_, nullptr, 0);
+    std::filesystem::create_directories(state);
+    const std::string out = state + "/stdout.txt";
+    process_ =
+        std::make_unique<SpawnedProcess>(QAX_SIM_BINARY, args, env, out, state + "/stderr.txt");
+    // It prints "... listening on https://127.0.0.1:PORT" once it serves.
+    for (int i = 0; i < 2000 && process_->running(); ++i) {
+        const std::string text = readWholeFile(out).value_or("");
+        const auto end = text.find('\n');
+        const auto colon = text.rfind(':', end);
+        if (end != std::string::npos && text.find("listening") < end &&
+            colon != std::string::npos) {
+            base_ = "https://127.0.0.1:" + text.substr(colon + 1, end - colon - 1);
+            return;
+        }
+        std::this_thread::sleep_for(std::chrono::milliseconds(5));
     }
 }
 

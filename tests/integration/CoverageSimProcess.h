@@ -3,11 +3,11 @@
 // stopped with SIGTERM when the object goes. Also reads its request log.
 #pragma once
 
-#include <sys/types.h>
-
+#include <memory>
 #include <string>
 #include <vector>
 
+#include "SpawnedProcess.h"
 #include "core/Value.h"
 
 namespace qax::test {
@@ -18,9 +18,7 @@ class CoverageSimProcess {
     CoverageSimProcess(const std::string& state, const std::string& platformRoot,
                        const std::vector<std::string>& extraArgs = {},
                        const std::vector<std::string>& environment = {});
-    ~CoverageSimProcess();
-    CoverageSimProcess(const CoverageSimProcess&) = delete;
-    CoverageSimProcess& operator=(const CoverageSimProcess&) = delete;
+    ~CoverageSimProcess() { process_->stop(); }
 
     // "https://127.0.0.1:PORT"; empty when the simulator did not start.
     const std::string& base() const { return base_; }
@@ -31,7 +29,7 @@ class CoverageSimProcess {
 
   private:
     std::string state_;
-    pid_t pid_ = -1;
+    std::unique_ptr<SpawnedProcess> process_;
     std::string base_;
 };
 

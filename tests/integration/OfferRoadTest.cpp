@@ -114,55 +114,46 @@ class OfferRoadTest : public ::testing::Test {
         return agent.countInLog(prefix + "finished") + agent.countInLog(prefix + "reported");
     }
     bool waitForEnds(const std::string& activity, int count) {
-        const auto deadline = std::chrono::steady_clock::now() + std::chrono::seconds(20);
-        while (ends(activity) < count) {
-            if (std::chrono::steady_clock::now() > deadline) {
-                return false;
-            }
+        for (int i = 0; i < 4000 && ends(activity) < count; ++i) {
             std::this_thread::sleep_for(std::chrono::milliseconds(5));
         }
-        return true;
+        return ends(activity) >= count;
     }
-    // The pending follow-ups as the settings application shows them, by title.
-    std::vector<Value> followUps() {
+    // The activities as `qaxctl activities` shows them, by name without the prefix.
+    std::map<std::string, Value> activities() {
+        std::map<std::string, Value> byName;
+        auto list = parseJson(ctl({"activities", "--json"}).out);
+        for (const auto& a : list && list->isArray() ? *list->asArray() : Value::Array{}) {
+            byName[a.find("identifier")->asString()->substr(sizeof "com.velmora.qaxagent")] = a;
+        }
+        return byName;
+    }
+    Value activity(const std::string& name) { return activities()[name]; }
+    std::optional<Date> target(const std::string& name) {
+        const Value a = activity(name);
+        const Value* date = a.find("targetDate");
+        return date && date->isString() ? Date::parseIso8601(*date->asString()) : std::nullopt;
+    }
+    bool registered(const std::string& name) { return activity(name).find("registration"); }
+    // The pending follow-ups as the settings application shows them, in short and sorted:
+    // "title|days|badge|notification".
+    std::vector<std::string> rows() {
         auto out = ctl({"followups", "--json"});
         auto list = parseJson(out.out);
         EXPECT_TRUE(list && list->isArray()) << out.out << out.err;
-        return list && list->isArray() ? *list->asArray() : std::vector<Value>{};
-    }
-    std::optional<Date> target(const std::string& activity) {
-        return FilePreferenceStore(FilePreferenceStore::domainPath(agent.home()))
-            .dateForKey("com.velmora.qaxagent." + activity + ".TargetDate");
-    }
-    bool registered(const std::string& activity) {
-        auto text =
-            test::readFile(std::filesystem::path(agent.platformRoot()) / "state/activities.plist");
-        auto registry = parsePlist(text);
-        const Value* entry =
-            registry ? registry->find("com.velmora.qaxagent." + activity) : nullptr;
-        return entry && entry->find("DueDate");
-    }
-    // One line of `followups --json` in short: "title|days|badge|notification".
-    static std::string row(const Value& item) {
-        auto text = [&](const char* key) {
-            const Value* v = item.find(key);
-            return v && v->isString() ? *v->asString() : std::string("-");
-        };
-        const Value* days = item.find("remainingDays");
-        const Value* badge = item.find("badge");
-        const Value* note = item.find("notification");
-        const Value* noteText = note ? note->find("text") : nullptr;
-        return text("title") + "|" + (days ? days->description() : "-") + "|" +
-               (badge && badge->asBool() && *badge->asBool() ? "badge" : "-") + "|" +
-               (noteText && noteText->isString() ? *noteText->asString() : "-");
-    }
-    std::vector<std::string> rows() {
-        std::vector<std::string> out;
-        for (const auto& item : followUps()) {
-            out.push_back(row(item));
+        std::vector<std::string> rows;
+        for (const auto& item : list && list->isArray() ? *list->asArray() : Value::Array{}) {
+            auto text = [&](const Value* v) {
+                return v && v->isString() ? *v->asString() : std::string("-");
+            };
+            const Value* days = item.find("remainingDays");
+            const Value* note = item.find("notification");
+            rows.push_back(text(item.find("title")) + "|" + (days ? days->description() : "-") +
+                           "|" + (item.find("badge")->truthy() ? "badge" : "-") + "|" +
+                           text(note ? note->find("text") : nullptr));
         }
-        std::sort(out.begin(), out.end());
-        return out;
+        std::sort(rows.begin(), rows.end());
+        return rows;
     }
 
     // Sets coverage-sim's scenario (a JSON object), or clears it without one.
@@ -206,9 +197,35 @@ TEST_F(OfferRoadTest, FortyDaysOfAnOffer) {
         "post upgrade activity hasn't yet been performed, perform upgrade activity"));
     EXPECT_EQ(target("followuppost"), day(10));
     EXPECT_TRUE(rows().empty());
+    // qaxctl activities shows the shipped launch configuration beside the agent's state.
+    const std::tuple<const char*, const char*, bool> launch[] = {
+        {"upgrade", "upgrade", false},
+        {"boot", "boot", false},
+        {"outreach", "interval", true},
+        {"followuppost", "interval", true},
+        {"conversionoutreach", "interval", true},
+        {"followuprefresh", "interval", false},
+    };
+    auto listed = activities();
+    EXPECT_EQ(listed.size(), std::size(launch));
+    for (const auto& [name, trigger, network] : launch) {
+        const Value& a = listed[name];
+        EXPECT_EQ(a.find("trigger") ? *a.find("trigger") : Value(), Value(trigger)) << name;
+        EXPECT_EQ(a.find("requiresNetwork") ? *a.find("requiresNetwork") : Value(), Value(network))
+            << name;
+    }
+    EXPECT_EQ(listed["outreach"].find("lastResult")->description(), "1");
+    EXPECT_NE(ctl({"activities"}).out.find("registration  due"), std::string::npos);
 
-    // Day 10: the post puts the item up, counts it once and starts the refresh chain.
+    // Day 10: the clock change reaches the agent at once; the post puts the item up, counts it
+    // once and starts the refresh chain.
+    const auto advanced = std::chrono::steady_clock::now();
     advance("10d");
+    ASSERT_TRUE(waitFor("Firing activity 'com.velmora.qaxagent.followuppost'")) << agent.log();
+    const double latency =
+        std::chrono::duration<double>(std::chrono::steady_clock::now() - advanced).count();
+    std::printf("qaxctl clock advance to the post's fire: %.3f s\n", latency);
+    EXPECT_LT(latency, 1.0);
     ASSERT_TRUE(waitForEnds("followuppost", 1)) << agent.log();
     EXPECT_EQ(rows(), std::vector<std::string>{"Add the Haverly plan|30|-|-"});
     EXPECT_EQ(target("followuprefresh"), day(11));

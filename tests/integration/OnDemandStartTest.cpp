@@ -1,6 +1,7 @@
-// The agent started on demand, as the user's service manager runs it: the first connection
-// starts it, it exits once idle, the next connection starts it again, and nothing is lost in
-// between (preferences kept, a client arriving while it exits served by the next instance).
+// The agent started on demand, as the user's service manager runs it: it serves the listening
+// socket it is handed, stays while a client is connected, exits once idle, and the next
+// instance on the same socket finds everything kept (preferences, a client that arrived while
+// the first was exiting).
 #include <gtest/gtest.h>
 #include <poll.h>
 #include <sys/socket.h>
@@ -12,7 +13,6 @@
 #include <thread>
 
 #include "AgentProcess.h"
-#include "SpawnedProcess.h"
 #include "devices/QAXDevice.h"
 #include "platform/host/HostIpcClient.h"
 
@@ -20,7 +20,6 @@ namespace qax {
 namespace {
 
 constexpr double kWait = 10;
-constexpr const char* kIdleExit = "QAX_IDLE_EXIT_SECONDS=1";
 constexpr const char* kExitedIdle = "Exiting after 1 seconds without a client";
 
 int bindUnixSocket(int type, const std::string& path) {
@@ -41,82 +40,19 @@ bool exitedCleanly(const std::optional<int>& status) {
     return status && WIFEXITED(*status) && WEXITSTATUS(*status) == 0;
 }
 
-std::optional<std::string> serialIn(const std::optional<Value>& reply) {
+std::optional<std::string> serialIn(const Value* reply) {
     auto device = reply ? QAXDevice::decode(*reply) : nullptr;
     return device ? device->serialNumber() : std::nullopt;
 }
 
-class OnDemandStartTest : public ::testing::Test {
-  protected:
-    void SetUp() override {
-        agent.writeRootFile("device.plist",
-                            Value(Value::Dictionary{{"SerialNumber", Value("OD-SN-1")},
-                                                    {"InternalBuild", Value(true)}}));
-        agent.registerApplication("tests", test::selfExecutable(), std::nullopt, Value(true));
-        std::filesystem::create_directories(agent.runtimeDirectory());
-    }
-
-    // The default device's serial number, asked on `client` (connected first if need be).
-    std::optional<std::string> defaultSerial(HostIpcClient& client) {
-        std::string error;
-        if (!client.isConnected() && !client.connect(agent.socketPath(), &error)) {
-            return std::nullopt;
-        }
-        auto reply = client.call("defaultDevice:", {}, kWait, &error);
-        return reply ? serialIn(reply->value) : std::nullopt;
-    }
-
-    std::string logPath() const { return agent.home() + "/agent.log"; }
-
-    test::AgentProcess agent;  // its home, platform root and environment; started here instead
-};
-
-TEST_F(OnDemandStartTest, FirstConnectionStartsItIdleEndsItTheNextStartsItAgainWithStateKept) {
-    const auto activator = test::findProgram("systemd-socket-activate");
-    if (!activator) {
-        GTEST_SKIP() << "systemd-socket-activate (Debian package systemd) is not installed";
-    }
-    // Listens on the agent's socket and starts the agent with it on the first connection.
-    auto listen = [&] {
-        std::vector<std::string> args{"-l", agent.socketPath(), "-E", kIdleExit};
-        for (const auto& variable : agent.environment()) {
-            args.insert(args.end(), {"-E", variable});
-        }
-        args.push_back(QAX_AGENT_BINARY);
-        const int before = agent.countInLog("Listening on");
-        auto process = std::make_unique<test::SpawnedProcess>(*activator, args, agent.environment(),
-                                                              logPath());
-        EXPECT_TRUE(agent.waitForLog("Listening on", before + 1, kWait)) << agent.log();
-        return process;
-    };
-
-    auto first = listen();
-    EXPECT_EQ(agent.countInLog("launched"), 0) << "nothing starts the agent before a client";
-    {
-        HostIpcClient client;
-        EXPECT_EQ(defaultSerial(client), "OD-SN-1") << agent.log();
-        std::this_thread::sleep_for(std::chrono::milliseconds(2500));
-        EXPECT_TRUE(first->running()) << "a connected client keeps the agent past its idle time";
-        auto written = test::runTool(QAX_CTL_BINARY,
-                                     {"defaults", "write", "SerialNumber", "-string", "OD-KEPT"},
-                                     agent.environment());
-        ASSERT_EQ(written.status, 0) << written.err;
-        EXPECT_EQ(defaultSerial(client), "OD-KEPT");
-    }
-    EXPECT_TRUE(exitedCleanly(first->waitForExit(kWait))) << agent.log();
-    EXPECT_EQ(agent.countInLog(kExitedIdle), 1);
-
-    auto second = listen();
-    HostIpcClient client;
-    EXPECT_EQ(defaultSerial(client), "OD-KEPT") << agent.log();
-    client.close();
-    EXPECT_EQ(agent.countInLog("Started on demand"), 2);
-    EXPECT_TRUE(exitedCleanly(second->waitForExit(kWait))) << agent.log();
-}
-
 // The service manager keeps its listening socket across instances: this test holds one the
 // same way, hands it to each instance and reads their readiness notices.
-TEST_F(OnDemandStartTest, AClientArrivingWhileTheAgentExitsIsServedByTheNextInstance) {
+TEST(OnDemandStartTest, IdleExitAndTheNextInstanceKeepStateAndALateClient) {
+    test::AgentProcess agent;  // its home, platform root and environment; started here instead
+    agent.writeRootFile("device.plist", Value(Value::Dictionary{{"SerialNumber", Value("OD-1")},
+                                                                {"InternalBuild", Value(true)}}));
+    agent.registerApplication("tests", test::selfExecutable(), std::nullopt, Value(true));
+    std::filesystem::create_directories(agent.runtimeDirectory());
     const int listening = bindUnixSocket(SOCK_STREAM, agent.socketPath());
     ASSERT_EQ(::listen(listening, 16), 0);
     const std::string notifyPath = agent.home() + "/manager-notify";
@@ -124,7 +60,8 @@ TEST_F(OnDemandStartTest, AClientArrivingWhileTheAgentExitsIsServedByTheNextInst
     ASSERT_GE(notices, 0);
     auto start = [&] {
         auto environment = agent.environment();
-        environment.insert(environment.end(), {kIdleExit, "NOTIFY_SOCKET=" + notifyPath});
+        environment.insert(environment.end(),
+                           {"QAX_IDLE_EXIT_SECONDS=1", "NOTIFY_SOCKET=" + notifyPath});
         // A copy without close-on-exec for the shell, which moves it to descriptor 3 and names
         // the agent's process id, as the service manager does.
         const std::string inherited = std::to_string(::dup(listening));
@@ -134,16 +71,32 @@ TEST_F(OnDemandStartTest, AClientArrivingWhileTheAgentExitsIsServedByTheNextInst
                                      "exec 3<&" + inherited + " " + inherited +
                                          "<&-; LISTEN_PID=$$ LISTEN_FDS=1 exec \"$0\"",
                                      QAX_AGENT_BINARY},
-            environment, logPath());
+            environment, agent.logPath());
         ::close(std::stoi(inherited));
         return process;
     };
+    auto defaultSerial = [&](HostIpcClient& client) -> std::optional<std::string> {
+        std::string error;
+        if (!client.isConnected() && !client.connect(agent.socketPath(), &error)) {
+            return std::nullopt;
+        }
+        auto reply = client.call("defaultDevice:", {}, kWait, &error);
+        return reply && reply->value ? serialIn(&*reply->value) : std::nullopt;
+    };
 
     auto first = start();
-    HostIpcClient client;
-    EXPECT_EQ(defaultSerial(client), "OD-SN-1") << agent.log();
-    client.close();
-    EXPECT_EQ(receiveNotice(notices), "READY=1\nSTATUS=Serving clients");
+    {
+        HostIpcClient client;
+        EXPECT_EQ(defaultSerial(client), "OD-1") << agent.log();
+        EXPECT_EQ(receiveNotice(notices), "READY=1\nSTATUS=Serving clients");
+        std::this_thread::sleep_for(std::chrono::milliseconds(1500));
+        EXPECT_TRUE(first->running()) << "a connected client keeps the agent past its idle time";
+        auto written = test::runTool(QAX_CTL_BINARY,
+                                     {"defaults", "write", "SerialNumber", "-string", "OD-KEPT"},
+                                     agent.environment());
+        ASSERT_EQ(written.status, 0) << written.err;
+        EXPECT_EQ(defaultSerial(client), "OD-KEPT");
+    }
     // Connects the moment the first instance decides to go.
     ASSERT_TRUE(agent.waitForLog(kExitedIdle, 1, kWait)) << agent.log();
     HostIpcClient late;
@@ -157,10 +110,10 @@ TEST_F(OnDemandStartTest, AClientArrivingWhileTheAgentExitsIsServedByTheNextInst
     auto second = start();
     auto reply = late.receive(kWait, &error);
     ASSERT_TRUE(reply) << error << "\n" << agent.log();
-    const Value* device = reply->find("reply");
-    EXPECT_EQ(serialIn(device ? std::optional(*device) : std::nullopt), "OD-SN-1");
+    EXPECT_EQ(serialIn(reply->find("reply")), "OD-KEPT");
     late.close();
     EXPECT_TRUE(exitedCleanly(second->waitForExit(kWait))) << agent.log();
+    EXPECT_EQ(agent.countInLog("Started on demand"), 2);
     ::close(listening);
     ::close(notices);
 }

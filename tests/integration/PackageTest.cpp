@@ -4,10 +4,8 @@
 #include <sys/wait.h>
 
 #include <filesystem>
-#include <thread>
 
 #include "AgentProcess.h"
-#include "SpawnedProcess.h"
 
 namespace qax {
 namespace {
@@ -20,11 +18,9 @@ TEST(PackageTest, UnpackedDebRunsTheAgentAndQaxctlAgainstATemporaryHome) {
     if (!dpkg || !dpkgDeb || !test::findProgram("dpkg-shlibdeps")) {
         GTEST_SKIP() << "dpkg, dpkg-deb or dpkg-shlibdeps (packages dpkg, dpkg-dev) is missing";
     }
-    test::TempDir dir;
-    test::AgentProcess home;  // its home, platform root and environment; nothing started
-    const auto environment = home.environment();
-
-    const fs::path out = dir.path() / "out";
+    test::AgentProcess agent;  // started from the unpacked package below
+    const auto environment = agent.environment();
+    const fs::path out = fs::path(agent.home()) / "out";
     auto built = test::runTool(
         QAX_CPACK_COMMAND,
         {"--config", std::string(QAX_BINARY_DIR) + "/CPackConfig.cmake", "-B", out.string()},
@@ -39,7 +35,7 @@ TEST(PackageTest, UnpackedDebRunsTheAgentAndQaxctlAgainstATemporaryHome) {
         EXPECT_NE(depends.out.find(package), std::string::npos) << depends.out;
     }
 
-    const fs::path root = dir.path() / "root";
+    const fs::path root = fs::path(agent.home()) / "unpacked";
     ASSERT_EQ(test::runTool(*dpkg, {"-x", deb.string(), root.string()}, environment).status, 0);
     for (const char* file :
          {"usr/lib/systemd/user/qaxagent.socket", "usr/lib/systemd/user/qaxagent-wake.timer",
@@ -53,18 +49,13 @@ TEST(PackageTest, UnpackedDebRunsTheAgentAndQaxctlAgainstATemporaryHome) {
 
     // A bare machine: no device.plist, so the agent describes the machine it runs on.
     const std::string qaxctl = (root / "usr/bin/qaxctl").string();
-    home.registerApplication("qaxctl", qaxctl, "com.velmora.Preferences", Value(true));
-    test::SpawnedProcess agent((root / "usr/lib/qaxagent/qaxagent").string(), {}, environment,
-                               home.home() + "/agent.log");
-    for (int i = 0; i < 2000 && !fs::is_socket(home.socketPath()) && agent.running(); ++i) {
-        std::this_thread::sleep_for(std::chrono::milliseconds(5));
-    }
+    agent.registerApplication("qaxctl", qaxctl, "com.velmora.Preferences", Value(true));
+    ASSERT_TRUE(agent.start((root / "usr/lib/qaxagent/qaxagent").string())) << agent.log();
     auto shown = test::runTool(qaxctl, {"default-device"}, environment);
-    EXPECT_EQ(shown.status, 0) << shown.err << home.log();
+    EXPECT_EQ(shown.status, 0) << shown.err << agent.log();
     EXPECT_NE(shown.out.find("Default Device"), std::string::npos) << shown.out;
-    agent.terminate();
-    auto status = agent.waitForExit(10);
-    EXPECT_TRUE(status && WIFEXITED(*status) && WEXITSTATUS(*status) == 0) << home.log();
+    const int status = agent.stop();
+    EXPECT_TRUE(WIFEXITED(status) && WEXITSTATUS(status) == 0) << agent.log();
 }
 
 }  // namespace

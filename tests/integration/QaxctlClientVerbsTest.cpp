@@ -1,111 +1,65 @@
 // qaxctl's client verbs: what each sends, how it prints each kind of reply, and how it
-// reports an agent that is absent, refuses it or answers an error. The replies come from a
-// stand-in on the agent's socket, so every reply shape can be tried; the refusal and one
-// real round trip come from the real agent.
+// reports bad usage, an absent agent or an error reply. The replies come from a stand-in on
+// the agent's socket, so every reply shape can be tried (the real agent's refusal and round
+// trips are in AgentServiceTest).
 #include <gtest/gtest.h>
 #include <poll.h>
 #include <sys/socket.h>
 #include <sys/un.h>
+#include <sys/wait.h>
 #include <unistd.h>
 
-#include <atomic>
 #include <chrono>
-#include <mutex>
-#include <thread>
 
 #include "AgentProcess.h"
 #include "core/JsonCodec.h"
 #include "core/PlistCodec.h"
 #include "devices/QAXDeviceInfo.h"
-#include "platform/host/FilePreferenceStore.h"
 #include "platform/host/IpcFrameCodec.h"
 #include "warranty/QAXWarranty.h"
 
 namespace qax {
 namespace {
 
-// Stands in for the agent on its socket: answers every request with the message set last
-// ({"reply": v}, {"error": text} or {} for a reply of none) and keeps the last request.
-class FakeAgent {
-  public:
-    explicit FakeAgent(const std::string& runtimeDirectory) {
-        std::filesystem::create_directories(runtimeDirectory);
-        const std::string path = runtimeDirectory + "/com.velmora.qaxagent";
-        sockaddr_un addr{};
-        addr.sun_family = AF_UNIX;
-        std::snprintf(addr.sun_path, sizeof addr.sun_path, "%s", path.c_str());
-        fd_ = ::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
-        if (::bind(fd_, reinterpret_cast<sockaddr*>(&addr), sizeof addr) != 0 ||
-            ::listen(fd_, 4) != 0) {
-            ADD_FAILURE() << "cannot listen on " << path;
-        }
-        thread_ = std::thread([this] { serve(); });
-    }
-    ~FakeAgent() {
-        stop_ = true;
-        thread_.join();
-        ::close(fd_);
-    }
+struct Exchange {
+    test::ToolResult result;
+    Value op, args;  // of the request qaxctl sent; null without one
+};
 
-    void answer(Value::Dictionary message) {
-        std::lock_guard lock(mutex_);
-        message_ = std::move(message);
+// Runs qaxctl with `args` while standing in for the agent on `listening`: the one request it
+// sends is answered with `message` ({"reply": v}, {"error": text} or {} for a reply of none).
+Exchange exchange(int listening, const std::vector<std::string>& environment,
+                  const std::vector<std::string>& args, Value::Dictionary message) {
+    test::TempDir out;
+    test::SpawnedProcess ctl(QAX_CTL_BINARY, args, environment, out.str() + "/out",
+                             out.str() + "/err");
+    Exchange e;
+    pollfd p{listening, POLLIN, 0};
+    const int client =
+        ::poll(&p, 1, 10'000) == 1 ? ::accept4(listening, nullptr, nullptr, SOCK_CLOEXEC) : -1;
+    IpcFrameCodec codec;
+    std::string payload;
+    char buffer[4096];
+    ssize_t n = 1;
+    while (client >= 0 && n > 0 && codec.next(payload) != IpcFrameCodec::Status::Frame) {
+        n = ::recv(client, buffer, sizeof buffer, 0);
+        codec.append(std::string_view(buffer, n > 0 ? static_cast<std::size_t>(n) : 0));
     }
-    std::pair<std::string, Value::Array> lastRequest() {
-        std::lock_guard lock(mutex_);
-        return last_;
-    }
-
-  private:
-    void serve() {
-        while (!stop_) {
-            pollfd p{fd_, POLLIN, 0};
-            if (::poll(&p, 1, 50) <= 0) {
-                continue;
-            }
-            const int client = ::accept4(fd_, nullptr, nullptr, SOCK_CLOEXEC);
-            if (client >= 0) {
-                answerOne(client);
-                ::close(client);
-            }
-        }
-    }
-
-    void answerOne(int client) {
-        IpcFrameCodec codec;
-        std::string payload;
-        char buffer[4096];
-        while (codec.next(payload) != IpcFrameCodec::Status::Frame) {
-            pollfd p{client, POLLIN, 0};
-            const ssize_t n =
-                ::poll(&p, 1, 5000) > 0 ? ::recv(client, buffer, sizeof buffer, 0) : 0;
-            if (n <= 0) {
-                return;
-            }
-            codec.append(std::string_view(buffer, static_cast<std::size_t>(n)));
-        }
-        auto request = parsePlist(payload);
-        if (!request) {
-            return;
-        }
-        Value::Dictionary reply;
-        {
-            std::lock_guard lock(mutex_);
-            last_ = {*request->find("op")->asString(), *request->find("args")->asArray()};
-            reply = message_;
-        }
-        reply["id"] = *request->find("id");
-        auto frame = IpcFrameCodec::encode(Value(std::move(reply)));
+    if (auto request = parsePlist(payload); request && request->isDictionary()) {
+        e.op = *request->find("op");
+        e.args = *request->find("args");
+        message["id"] = *request->find("id");
+        auto frame = IpcFrameCodec::encode(Value(std::move(message)));
         ::send(client, frame->data(), frame->size(), MSG_NOSIGNAL);
     }
-
-    int fd_ = -1;
-    std::thread thread_;
-    std::atomic<bool> stop_{false};
-    std::mutex mutex_;
-    Value::Dictionary message_;
-    std::pair<std::string, Value::Array> last_;
-};
+    if (client >= 0) {
+        ::close(client);
+    }
+    auto status = ctl.waitForExit(30);
+    e.result = {status && WIFEXITED(*status) ? WEXITSTATUS(*status) : -1,
+                test::readFile(out.path() / "out"), test::readFile(out.path() / "err")};
+    return e;
+}
 
 Value summaryEndingIn(double seconds) {
     using namespace std::chrono;
@@ -132,7 +86,29 @@ class QaxctlClientVerbsTest : public ::testing::Test {
 };
 
 TEST_F(QaxctlClientVerbsTest, EachVerbSendsItsRequestAndPrintsTheReply) {
-    FakeAgent fake(agent.runtimeDirectory());
+    auto absent = run({"device-info"});
+    EXPECT_EQ(absent.status, 69);
+    EXPECT_NE(absent.err.find("is qaxagent running?"), std::string::npos) << absent.err;
+    for (const auto& args : std::vector<std::vector<std::string>>{
+             {"device-info", "A", "B"},
+             {"device-info", "--policy", "soon"},
+             {"device-infos", "extra"},
+             {"dismiss-notification", "A", "B"},
+             {"schedule-outreach", "--after", "-5"},
+             {"account-added", "--timeout", "soon"},
+             {"store-check", "--json"},
+         }) {
+        auto result = run(args);
+        EXPECT_EQ(result.status, 64) << args[0] << " " << result.err;
+        EXPECT_EQ(result.err.rfind("usage: qaxctl " + args[0], 0), 0u) << result.err;
+    }
+
+    std::filesystem::create_directories(agent.runtimeDirectory());
+    const int listening = ::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
+    sockaddr_un address{.sun_family = AF_UNIX, .sun_path = {}};
+    std::snprintf(address.sun_path, sizeof address.sun_path, "%s", agent.socketPath().c_str());
+    ASSERT_EQ(::bind(listening, reinterpret_cast<sockaddr*>(&address), sizeof address), 0);
+    ASSERT_EQ(::listen(listening, 4), 0);
     auto device = QAXDevice::deviceWithName("Morning", "W1", Date(1.7e9), QAXDeviceTypeWatch);
     auto offer = QAXDeviceInfo::deviceInfoWithDevice(
                      device, QAXWarranty::initWithDictionary(tp.platform,
@@ -200,19 +176,18 @@ TEST_F(QaxctlClientVerbsTest, EachVerbSendsItsRequestAndPrintsTheReply) {
     };
     for (const auto& row : rows) {
         SCOPED_TRACE(row.args[0] + (row.args.size() > 1 ? " " + row.args[1] : ""));
-        fake.answer(row.answer);
-        auto result = run(row.args);
+        auto [result, op, sent] = exchange(listening, agent.environment(), row.args, row.answer);
         EXPECT_EQ(result.status, row.status) << result.err;
         EXPECT_NE((row.status == 0 ? result.out : result.err).find(row.out), std::string::npos)
             << result.out << result.err;
-        auto [op, sent] = fake.lastRequest();
-        EXPECT_EQ(op, row.op);
-        EXPECT_EQ(Value(sent), Value(row.sent));
+        EXPECT_EQ(op, Value(row.op));
+        EXPECT_EQ(sent, Value(row.sent));
     }
 
     // The JSON form of a device info, which scripts read.
-    fake.answer(reply(offer));
-    auto json = parseJson(run({"device-info", "--json"}).out);
+    auto json =
+        parseJson(exchange(listening, agent.environment(), {"device-info", "--json"}, reply(offer))
+                      .result.out);
     ASSERT_TRUE(json && json->isDictionary());
     const Value* warranty = json->find("warranty");
     ASSERT_TRUE(warranty && warranty->isDictionary());
@@ -232,49 +207,8 @@ TEST_F(QaxctlClientVerbsTest, EachVerbSendsItsRequestAndPrintsTheReply) {
     env.push_back("QAX_RUNTIME_DIR=" + agent.home() + "/elsewhere");
     env.push_back("XDG_RUNTIME_DIR=" + agent.home());
     std::filesystem::rename(agent.runtimeDirectory(), agent.home() + "/qaxagent");
-    fake.answer(reply(Value(true)));
-    EXPECT_EQ(test::runTool(QAX_CTL_BINARY, {"schedule-outreach"}, env).status, 0);
-}
-
-TEST_F(QaxctlClientVerbsTest, BadUsageAndAnAbsentOrRefusingAgent) {
-    const std::vector<std::vector<std::string>> badUsage = {
-        {"device-info", "A", "B"},
-        {"device-info", "--policy", "soon"},
-        {"device-infos", "extra"},
-        {"dismiss-notification", "A", "B"},
-        {"schedule-outreach", "--after", "-5"},
-        {"account-added", "--timeout", "soon"},
-        {"store-check", "--json"},
-    };
-    for (const auto& args : badUsage) {
-        auto result = run(args);
-        EXPECT_EQ(result.status, 64) << args[0] << " " << result.err;
-        EXPECT_EQ(result.err.rfind("usage: qaxctl " + args[0], 0), 0u) << result.err;
-    }
-
-    auto absent = run({"device-info"});
-    EXPECT_EQ(absent.status, 69);
-    EXPECT_NE(absent.err.find("is qaxagent running?"), std::string::npos) << absent.err;
-
-    agent.writeRootFile("device.plist", Value(Value::Dictionary{{"SerialNumber", Value("SN-1")},
-                                                                {"InternalBuild", Value(true)}}));
-    ASSERT_TRUE(agent.start()) << agent.log();
-    auto refused = run({"store-check", "com.velmora.support"});
-    EXPECT_EQ(refused.status, 69);
-    EXPECT_NE(refused.err.find("the agent closed the connection"), std::string::npos)
-        << refused.err;
-
-    // Entitled: a request the agent serves, before and after an override is stored.
-    agent.registerApplication("qaxctl", std::filesystem::canonical(QAX_CTL_BINARY).string(),
-                              "com.velmora.Preferences", Value(true));
-    auto plain = run({"web-url-override"});
-    EXPECT_EQ(plain.status, 0) << plain.err;
-    EXPECT_EQ(plain.out, "no web URL override\n");
-    FilePreferenceStore(FilePreferenceStore::domainPath(agent.home()))
-        .setObject("WebFlowURL", Value("https://flow.example/x"));
-    auto stored = run({"web-url-override", "--json"});
-    EXPECT_EQ(stored.status, 0) << stored.err;
-    EXPECT_EQ(stored.out, "\"https://flow.example/x\"\n");
+    EXPECT_EQ(exchange(listening, env, {"schedule-outreach"}, reply(Value(true))).result.status, 0);
+    ::close(listening);
 }
 
 }  // namespace
