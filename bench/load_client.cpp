@@ -10,7 +10,11 @@
 //  - 1,000 connections held at once, each answered, and the resident memory they add;
 //  - a forced download of 10 devices against coverage-sim answering after 200 ms, against
 //    a forced download of one device.
-// It prints numbers; it asserts nothing.  Usage: qax_load [calls per latency measurement]
+// It prints numbers; it asserts nothing.
+// Usage: qax_load [calls per latency measurement]
+//        qax_load --hold device|paired|cached SECONDS CLIENTS
+//          (only keeps the agent busy with one operation, for a profiler attached to the pid
+//          it prints)
 #include <sys/resource.h>
 #include <sys/socket.h>
 #include <sys/un.h>
@@ -141,7 +145,7 @@ class RawConnection {
     std::size_t last_ = 0;
 };
 
-// Writes every byte back as it came: socket costs only.
+// Writes every byte back as it came, a thread per connection: socket costs only.
 class EchoServer {
   public:
     explicit EchoServer(std::string path) : path_(std::move(path)) {
@@ -150,23 +154,35 @@ class EchoServer {
         addr.sun_family = AF_UNIX;
         std::snprintf(addr.sun_path, sizeof addr.sun_path, "%s", path_.c_str());
         bind(fd_, reinterpret_cast<sockaddr*>(&addr), sizeof addr);
-        listen(fd_, 16);
-        thread_ = std::thread([this] { serve(); });
+        listen(fd_, 64);
+        acceptor_ = std::thread([this] { acceptAll(); });
     }
     ~EchoServer() {
         shutdown(fd_, SHUT_RDWR);
+        acceptor_.join();
         ::close(fd_);
-        thread_.join();
+        for (int c : connections_) {
+            shutdown(c, SHUT_RDWR);
+        }
+        for (auto& t : servers_) {
+            t.join();
+        }
+        for (int c : connections_) {
+            ::close(c);
+        }
         unlink(path_.c_str());
     }
     const std::string& path() const { return path_; }
 
   private:
-    void serve() {
-        int c = accept(fd_, nullptr, nullptr);
-        if (c < 0) {
-            return;
+    void acceptAll() {
+        int c;
+        while ((c = accept4(fd_, nullptr, nullptr, SOCK_CLOEXEC)) >= 0) {
+            connections_.push_back(c);
+            servers_.emplace_back([c] { echo(c); });
         }
+    }
+    static void echo(int c) {
         char buf[65536];
         ssize_t n;
         while ((n = read(c, buf, sizeof buf)) > 0) {
@@ -174,16 +190,17 @@ class EchoServer {
             while (off < n) {
                 ssize_t w = write(c, buf + off, static_cast<std::size_t>(n - off));
                 if (w <= 0) {
-                    break;
+                    return;
                 }
                 off += w;
             }
         }
-        ::close(c);
     }
     std::string path_;
     int fd_ = -1;
-    std::thread thread_;
+    std::thread acceptor_;
+    std::vector<int> connections_;
+    std::vector<std::thread> servers_;
 };
 
 long statusKilobytes(pid_t pid, const char* field) {
@@ -198,13 +215,18 @@ long statusKilobytes(pid_t pid, const char* field) {
     return -1;
 }
 
-// User plus system CPU time of a process, in seconds.
-double cpuSeconds(pid_t pid) {
+// User and system CPU time of a process, in seconds.
+struct CpuTime {
+    double user = 0, system = 0;
+    CpuTime operator-(const CpuTime& o) const { return {user - o.user, system - o.system}; }
+};
+
+CpuTime cpuTime(pid_t pid) {
     std::ifstream stat("/proc/" + std::to_string(pid) + "/stat");
     std::string text((std::istreambuf_iterator<char>(stat)), std::istreambuf_iterator<char>());
     const auto close = text.rfind(')');
     if (close == std::string::npos) {
-        return 0;
+        return {};
     }
     std::istringstream fields(text.substr(close + 2));
     std::string field;
@@ -217,7 +239,8 @@ double cpuSeconds(pid_t pid) {
             break;
         }
     }
-    return static_cast<double>(utime + stime) / static_cast<double>(sysconf(_SC_CLK_TCK));
+    const auto tick = static_cast<double>(sysconf(_SC_CLK_TCK));
+    return {static_cast<double>(utime) / tick, static_cast<double>(stime) / tick};
 }
 
 std::string describeMachine() {
@@ -249,11 +272,13 @@ void describeDevice(qax::test::AgentProcess& agent, const qax::test::CoverageSim
     for (int i = 1; i <= watches; ++i) {
         char serial[32];
         std::snprintf(serial, sizeof serial, "W7LOAD%06d", i);
-        paired.push_back(Value::Dictionary{{"name", "Watch " + std::to_string(i)},
-                                           {"serialNumber", std::string(serial)},
-                                           {"pairedDate", qax::Date(1700000000 + i)},
-                                           {"isPaired", true},
-                                           {"isArchived", false}});
+        Value::Dictionary watch;
+        watch["name"] = "Watch " + std::to_string(i);
+        watch["serialNumber"] = std::string(serial);
+        watch["pairedDate"] = qax::Date(1700000000 + i);
+        watch["isPaired"] = true;
+        watch["isArchived"] = false;
+        paired.emplace_back(std::move(watch));
     }
     agent.writeRootFile("paired-devices.plist", paired);
     agent.writeRootFile(
@@ -310,10 +335,42 @@ void printLatency(const Operation& op, const Stats& floor) {
                 a.median / floor.median, a.p99 / floor.p99);
 }
 
+struct Throughput {
+    long requests = 0;
+    double seconds = 0;
+    double rate() const { return seconds > 0 ? static_cast<double>(requests) / seconds : 0; }
+};
+
+// Runs `frame` on `clients` connections for `seconds`.
+Throughput throughput(const std::string& socketPath, const std::string& frame, int clients,
+                      double seconds) {
+    std::atomic<long> done{0};
+    std::atomic<bool> stop{false};
+    std::vector<std::thread> threads;
+    auto start = SteadyClock::now();
+    for (int c = 0; c < clients; ++c) {
+        threads.emplace_back([&] {
+            RawConnection connection(socketPath);
+            long n = 0;
+            while (!stop && connection.roundTrip(frame)) {
+                ++n;
+            }
+            done += n;
+        });
+    }
+    std::this_thread::sleep_for(std::chrono::duration<double>(seconds));
+    stop = true;
+    for (auto& t : threads) {
+        t.join();
+    }
+    return {done.load(), secondsSince(start)};
+}
+
 }  // namespace
 
 int main(int argc, char** argv) {
-    const int calls = argc > 1 ? std::max(100, std::atoi(argv[1])) : 3000;
+    const bool hold = argc > 4 && std::string(argv[1]) == "--hold";
+    const int calls = argc > 1 && !hold ? std::max(100, std::atoi(argv[1])) : 3000;
     const int perRound = std::max(10, calls / kRounds);
     rlimit lim{};
     getrlimit(RLIMIT_NOFILE, &lim);
@@ -363,6 +420,16 @@ int main(int argc, char** argv) {
                    requestFrame(kAllDeviceInfos, {Value(kCachedOnly), Value(false)}),
                    {},
                    {}});
+    if (hold) {
+        const std::string which = argv[2];
+        const auto& op = ops[which == "paired" ? 1 : which == "cached" ? 2 : 0];
+        std::printf("agent pid %d: %s\n", agent->pid(), op.name);
+        std::fflush(stdout);
+        const auto run = throughput(agent->socketPath(), op.frame, std::max(1, std::atoi(argv[4])),
+                                    std::atof(argv[3]));
+        std::printf("%.0f requests/s\n", run.rate());
+        return 0;
+    }
     {
         EchoServer echoServer(agent->home() + "/echo.sock");
         RawConnection echo(echoServer.path());
@@ -412,33 +479,24 @@ int main(int argc, char** argv) {
         printLatency(op, floor);
     }
 
-    for (int clients : {1, 2, 4, 8}) {
-        std::atomic<long> done{0};
-        std::atomic<bool> stop{false};
-        std::vector<std::thread> threads;
-        const double cpuBefore = cpuSeconds(agent->pid());
-        auto start = SteadyClock::now();
-        for (int c = 0; c < clients; ++c) {
-            threads.emplace_back([&] {
-                RawConnection connection(agent->socketPath());
-                long n = 0;
-                while (!stop && connection.roundTrip(ops[0].frame)) {
-                    ++n;
-                }
-                done += n;
-            });
-        }
-        std::this_thread::sleep_for(std::chrono::duration<double>(kThroughputSeconds));
-        stop = true;
-        for (auto& t : threads) {
-            t.join();
-        }
-        const double elapsed = secondsSince(start);
-        const double cpu = cpuSeconds(agent->pid()) - cpuBefore;
+    {
+        EchoServer echoServer(agent->home() + "/echo-many.sock");
         std::printf(
-            "throughput, %d client(s)           %8.0f requests/s, agent CPU %5.1f us/request\n",
-            clients, static_cast<double>(done.load()) / elapsed,
-            done.load() > 0 ? cpu / static_cast<double>(done.load()) * 1e6 : 0.0);
+            "throughput (defaultDevice:)      echo floor   agent      agent CPU per request\n");
+        for (int clients : {1, 2, 4, 8}) {
+            const auto echo =
+                throughput(echoServer.path(), ops[0].frame, clients, kThroughputSeconds);
+            const CpuTime before = cpuTime(agent->pid());
+            const auto run =
+                throughput(agent->socketPath(), ops[0].frame, clients, kThroughputSeconds);
+            const CpuTime cpu = cpuTime(agent->pid()) - before;
+            const double n = std::max<double>(1, static_cast<double>(run.requests));
+            std::printf(
+                "  %d client(s)                     %7.0f/s   %7.0f/s  %5.1f us (user %.1f, system "
+                "%.1f)\n",
+                clients, echo.rate(), run.rate(), (cpu.user + cpu.system) / n * 1e6,
+                cpu.user / n * 1e6, cpu.system / n * 1e6);
+        }
     }
 
     {
