@@ -50,7 +50,7 @@ constexpr const char* kAllDeviceInfos = "getAllDeviceInfosUsingPolicy:updateFoll
 constexpr const char* kDeviceInfo = "getDeviceInfoForSerialNumber:usingPolicy:withReply:";
 constexpr std::int64_t kCachedOnly = 1;
 constexpr std::int64_t kForceDownload = 2;
-constexpr int kRounds = 10;
+constexpr int kRounds = 30;
 constexpr int kConnections = 1000;
 constexpr double kThroughputSeconds = 1.5;
 

@@ -243,9 +243,15 @@ HeldLines& heldLines() {
     return held;
 }
 
-std::mutex& stderrMutex() {
-    static std::mutex mutex;
-    return mutex;
+void writeHeldLines(HeldLines& held) {
+    if (held.text.empty()) {
+        return;
+    }
+    StderrLogSink::writeToStderr(held.text);
+    held.text.clear();
+    if (held.text.capacity() > kMaxHeldBytes) {
+        std::string().swap(held.text);
+    }
 }
 
 constexpr std::size_t kTimestampBytes = 32;
@@ -283,7 +289,9 @@ std::string_view formatTimestamp(char (&out)[kTimestampBytes]) {
 }  // namespace
 
 void StderrLogSink::writeToStderr(std::string_view bytes) {
-    std::lock_guard lock(stderrMutex());
+    // No lock: one write() puts a whole buffer of lines at the end of a file or into the
+    // journal's socket at once, and two threads' buffers do not mix. Only a short write (a full
+    // disk) could let another thread's lines in between the pieces.
     while (!bytes.empty()) {
         const ssize_t n = ::write(STDERR_FILENO, bytes.data(), bytes.size());
         if (n < 0 && errno == EINTR) {
@@ -308,8 +316,7 @@ void StderrLogSink::write(LogLevel level, std::string_view subsystem, std::strin
     held.text += formatLine(level, subsystem, category, message, stamp, journal_);
     // An error goes out at once, with what led to it: the process may be about to end.
     if (level == LogLevel::Error || held.text.size() > kMaxHeldBytes) {
-        writeToStderr(held.text);
-        held.text.clear();
+        writeHeldLines(held);
     }
 }
 
@@ -319,12 +326,8 @@ LogBatch::LogBatch() {
 
 LogBatch::~LogBatch() {
     HeldLines& held = heldLines();
-    if (--held.depth == 0 && !held.text.empty()) {
-        StderrLogSink::writeToStderr(held.text);
-        held.text.clear();
-        if (held.text.capacity() > kMaxHeldBytes) {
-            std::string().swap(held.text);
-        }
+    if (--held.depth == 0) {
+        writeHeldLines(held);
     }
 }
 

@@ -134,9 +134,9 @@ inline constexpr const char* kLogCategory = "core";
 Log& qaxLog();
 
 // Lines this thread writes to a StderrLogSink while a LogBatch lives are held and written
-// together, with one system call, when the outermost batch ends; an error line writes what is
-// held at once. For bounded work that never waits (serving a request), so that its lines cost
-// one write rather than one each. Each line keeps the time it was logged at.
+// together, with one system call, when the outermost batch ends; an error line is written at
+// once, with what is held. For bounded work that never waits (serving a request), so that its
+// lines cost one write, made after its reply. Each line keeps the time it was logged at.
 class LogBatch {
   public:
     LogBatch();
@@ -166,7 +166,7 @@ class StderrLogSink : public LogSink {
                                   std::string_view time, bool journal);
     // Whether `fd` is the stream JOURNAL_STREAM ("device:inode") names.
     static bool isJournalStream(const char* journalStream, int fd);
-    // Writes `bytes` to stderr whole, one writer at a time.
+    // Writes `bytes` to stderr with one write() where it can.
     static void writeToStderr(std::string_view bytes);
 
   private:
