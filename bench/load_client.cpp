@@ -425,9 +425,14 @@ int main(int argc, char** argv) {
         const auto& op = ops[which == "paired" ? 1 : which == "cached" ? 2 : 0];
         std::printf("agent pid %d: %s\n", agent->pid(), op.name);
         std::fflush(stdout);
+        const CpuTime before = cpuTime(agent->pid());
         const auto run = throughput(agent->socketPath(), op.frame, std::max(1, std::atoi(argv[4])),
                                     std::atof(argv[3]));
-        std::printf("%.0f requests/s\n", run.rate());
+        const CpuTime cpu = cpuTime(agent->pid()) - before;
+        const double n = std::max<double>(1, static_cast<double>(run.requests));
+        std::printf("%.0f requests/s, agent CPU %.1f us/request (user %.1f, system %.1f)\n",
+                    run.rate(), (cpu.user + cpu.system) / n * 1e6, cpu.user / n * 1e6,
+                    cpu.system / n * 1e6);
         return 0;
     }
     {

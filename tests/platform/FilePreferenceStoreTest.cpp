@@ -3,9 +3,11 @@
 #include <filesystem>
 #include <thread>
 
+#include "core/FileSnapshotScope.h"
 #include "core/PlistCodec.h"
 #include "fakes/TestPlatform.h"
 #include "platform/QAXSettings.h"
+#include "platform/host/CachedPlistFile.h"
 #include "platform/host/FilePreferenceStore.h"
 
 namespace qax {
@@ -90,6 +92,35 @@ TEST_F(FilePreferenceStoreTest, AnotherProcessWritesAreSeenOnTheNextRead) {
     ASSERT_TRUE(engineer.removeObject("SerialNumber"));
     EXPECT_FALSE(agent.objectForKey("SerialNumber"));
     EXPECT_EQ(agent.allKeys(), std::vector<std::string>{"PostUpgradeActivityCompleted"});
+}
+
+TEST_F(FilePreferenceStoreTest, WithinASnapshotScopeFilesAreLookedAtOnce) {
+    // One piece of work (a request) sees each file as at its first look; the next sees edits.
+    FilePreferenceStore agent(path), engineer(path);
+    const std::string device = env.home.str() + "/device.plist";
+    CachedPlistFile deviceFile(device);
+    ASSERT_TRUE(engineer.setObject("SerialNumber", Value("FIRST")));
+    writeFile(device, *toXmlPlist(Value(Value::Dictionary{{"SerialNumber", "FIRST"}})));
+    auto serials = [&] {
+        auto root = deviceFile.read();
+        const Value* serial = root ? root->find("SerialNumber") : nullptr;
+        return std::make_pair(agent.stringForKey("SerialNumber").value_or(""),
+                              serial ? *serial->asString() : "");
+    };
+    {
+        FileSnapshotScope request;
+        EXPECT_EQ(serials(), std::make_pair(std::string("FIRST"), std::string("FIRST")));
+        ASSERT_TRUE(engineer.setObject("SerialNumber", Value("SECOND")));
+        writeFile(device, *toXmlPlist(Value(Value::Dictionary{{"SerialNumber", "SECOND"}})));
+        EXPECT_EQ(serials(), std::make_pair(std::string("FIRST"), std::string("FIRST")));
+        // The store's own writes are seen at once.
+        ASSERT_TRUE(agent.setObject("SerialNumber", Value("OWN")));
+        EXPECT_EQ(agent.stringForKey("SerialNumber"), "OWN");
+    }
+    ASSERT_TRUE(engineer.setObject("SerialNumber", Value("THIRD")));
+    EXPECT_EQ(serials(), std::make_pair(std::string("THIRD"), std::string("SECOND")));
+    FileSnapshotScope next;
+    EXPECT_EQ(serials(), std::make_pair(std::string("THIRD"), std::string("SECOND")));
 }
 
 TEST_F(FilePreferenceStoreTest, ConcurrentWritersLoseNoKey) {

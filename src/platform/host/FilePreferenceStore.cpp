@@ -8,6 +8,7 @@
 #include <filesystem>
 
 #include "core/AtomicFile.h"
+#include "core/FileSnapshotScope.h"
 #include "core/Log.h"
 #include "core/PlistCodec.h"
 
@@ -91,6 +92,11 @@ Value::Dictionary FilePreferenceStore::loadLocked(const FileIdentity& identity) 
 }
 
 void FilePreferenceStore::refreshLocked() {
+    const std::uint64_t scope = FileSnapshotScope::current();
+    if (loadedOnce_ && scope != 0 && scope == checkedInScope_) {
+        return;  // looked at already during this piece of work
+    }
+    checkedInScope_ = scope;
     FileIdentity id = currentIdentity();
     if (loadedOnce_ && id == loaded_) {
         return;

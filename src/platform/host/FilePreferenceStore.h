@@ -2,11 +2,13 @@
 // $HOME/Library/Preferences). Registered defaults live in memory only. Every write is a
 // read-modify-write of the file under an advisory lock, replaced atomically; reads reload
 // the file when its identity or modification time changed, so edits by another process
-// (qaxctl) are seen on the next read. Thread-safe (one mutex).
+// (qaxctl) are seen on the next read (within a FileSnapshotScope, the file is looked at once).
+// Thread-safe (one mutex).
 #pragma once
 
 #include <sys/types.h>
 
+#include <cstdint>
 #include <mutex>
 #include <string>
 
@@ -53,6 +55,8 @@ class FilePreferenceStore : public PreferenceStore {
     Value::Dictionary stored_;
     FileIdentity loaded_;
     bool loadedOnce_ = false;
+    // The FileSnapshotScope in which the file was last looked at.
+    std::uint64_t checkedInScope_ = 0;
 };
 
 }  // namespace qax

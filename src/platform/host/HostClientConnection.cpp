@@ -6,6 +6,7 @@
 #include <chrono>
 #include <vector>
 
+#include "core/FileSnapshotScope.h"
 #include "core/Log.h"
 #include "core/OnceCallback.h"
 #include "core/PlistCodec.h"
@@ -105,8 +106,10 @@ void HostClientConnection::readMore() {
             self->closeNow();
             return;
         }
-        // The request's log lines go out together, after its reply.
+        // The request's log lines go out together, after its reply, and it sees each file it
+        // reads as it was at its first look.
         LogBatch batch;
+        FileSnapshotScope snapshot;
         self->readAvailable();
     });
 }
