@@ -11,7 +11,8 @@
 //  - a forced download of 10 devices against coverage-sim answering after 200 ms, against
 //    a forced download of one device.
 // It prints numbers; it asserts nothing.
-// Usage: qax_load [calls per latency measurement]
+// Usage: qax_load [calls per latency measurement]   (QAX_LOAD_KEEP_LOG=FILE keeps the log of
+//        the agent that downloads)
 //        qax_load --hold device|paired|cached SECONDS CLIENTS
 //          (only keeps the agent busy with one operation, for a profiler attached to the pid
 //          it prints)
@@ -576,6 +577,9 @@ int main(int argc, char** argv) {
         oneOk += got;
         ten.push_back(timed(kAllDeviceInfos, {Value(kForceDownload), Value(false)}, &got));
         tenOk += got;
+    }
+    if (const char* keep = std::getenv("QAX_LOAD_KEEP_LOG")) {
+        std::ofstream(keep) << downloader.log();  // the downloads' timeline, for a closer look
     }
     const Stats oneStats = stats(one), tenStats = stats(ten);
     std::printf("forced download, server answers after 200 ms (median of 5)\n");

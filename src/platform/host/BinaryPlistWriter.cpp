@@ -1,5 +1,6 @@
 #include "platform/host/BinaryPlistWriter.h"
 
+#include <algorithm>
 #include <bit>
 #include <cmath>
 #include <cstdint>
@@ -38,12 +39,18 @@ struct Objects {
     };
     std::vector<Object> list;
     std::vector<std::uint64_t> refs;
+    // Bytes of strings and data, to size the output once.
+    std::size_t payloadBytes = 0;
 
     // False when the tree holds a null, which has no binary form.
     bool add(const Value& v, std::uint64_t& number) {
         number = list.size();
         list.push_back({&v, {}, refs.size()});
-        if (const auto* array = v.asArray()) {
+        if (const auto* text = v.asString()) {
+            payloadBytes += text->size();
+        } else if (const auto* data = v.asData()) {
+            payloadBytes += data->size();
+        } else if (const auto* array = v.asArray()) {
             const std::size_t first = refs.size();
             refs.resize(first + array->size());
             for (std::size_t i = 0; i < array->size(); ++i) {
@@ -61,6 +68,7 @@ struct Objects {
             for (const auto& [key, item] : *dictionary) {
                 refs[first + i] = list.size();
                 list.push_back({nullptr, key, 0});
+                payloadBytes += key.size();
                 std::uint64_t child = 0;
                 if (!add(item, child)) {
                     return false;
@@ -74,9 +82,11 @@ struct Objects {
 };
 
 void appendBigEndian(std::string& out, std::uint64_t v, std::size_t bytes) {
-    for (std::size_t i = bytes; i-- > 0;) {
-        out += static_cast<char>((v >> (8 * i)) & 0xff);
+    char buffer[8];
+    for (std::size_t i = 0; i < bytes; ++i) {
+        buffer[i] = static_cast<char>((v >> (8 * (bytes - 1 - i))) & 0xff);
     }
+    out.append(buffer, bytes);
 }
 
 std::size_t bytesFor(std::uint64_t v) {
@@ -134,10 +144,8 @@ char32_t nextCodePoint(std::string_view s, std::size_t& i) {
 
 void appendString(std::string& out, std::string_view s) {
     s = s.substr(0, s.find('\0'));
-    bool ascii = true;
-    for (char c : s) {
-        ascii = ascii && static_cast<unsigned char>(c) < 0x80;
-    }
+    const bool ascii = std::all_of(s.begin(), s.end(),
+                                   [](char c) { return static_cast<unsigned char>(c) < 0x80; });
     if (ascii) {
         appendMarker(out, kAsciiString, s.size());
         out.append(s);
@@ -231,7 +239,10 @@ std::optional<std::string> BinaryPlistWriter::write(const Value& value, std::siz
     }
     const std::size_t refBytes = bytesFor(objects.list.size());
     std::string out(headroom, '\0');
-    out.reserve(headroom + kMagic.size() + 16 * objects.list.size() + kTrailerBytes);
+    // Markers, lengths, numbers and references take at most 16 bytes an object, and a string
+    // of n bytes at most 2n as UTF-16.
+    out.reserve(headroom + kMagic.size() + 2 * objects.payloadBytes +
+                (16 + 2 * refBytes) * objects.list.size() + kTrailerBytes);
     out.append(kMagic);
     std::vector<std::uint64_t> offsets;
     offsets.reserve(objects.list.size());
