@@ -123,22 +123,35 @@ TEST_F(FilePreferenceStoreTest, WithinASnapshotScopeFilesAreLookedAtOnce) {
     EXPECT_EQ(serials(), std::make_pair(std::string("THIRD"), std::string("SECOND")));
 }
 
-TEST_F(FilePreferenceStoreTest, ConcurrentWritersLoseNoKey) {
+TEST_F(FilePreferenceStoreTest, ConcurrentWritersAndReadersLoseNoKey) {
     constexpr int kWriters = 4, kKeys = 25;
-    std::vector<std::thread> threads;
-    for (int w = 0; w < kWriters; ++w) {
-        threads.emplace_back([&, w] {
-            FilePreferenceStore store(path);  // each thread its own view, like separate processes
-            for (int k = 0; k < kKeys; ++k) {
-                store.setObject("w" + std::to_string(w) + "k" + std::to_string(k), Value(k));
-            }
-        });
+    // Threads of one store share writes; separate stores behave like separate processes.
+    for (const bool shared : {true, false}) {
+        std::filesystem::remove(path);
+        FilePreferenceStore common(path);
+        std::vector<std::thread> threads;
+        for (int w = 0; w <= kWriters; ++w) {
+            threads.emplace_back([&, w] {
+                FilePreferenceStore own(path);
+                FilePreferenceStore& store = shared ? common : own;
+                for (int k = 0; k < kKeys; ++k) {
+                    if (w == kWriters) {  // a reader, in the writers' way
+                        store.objectForKey("w0k0");
+                    } else {
+                        EXPECT_TRUE(store.setObject(
+                            "w" + std::to_string(w) + "k" + std::to_string(k), Value(k)));
+                    }
+                }
+            });
+        }
+        for (auto& t : threads) {
+            t.join();
+        }
+        FilePreferenceStore reader(path);
+        EXPECT_EQ(reader.allKeys().size(), static_cast<std::size_t>(kWriters * kKeys)) << shared;
+        EXPECT_EQ(reader.integerForKey("w3k24"), 24);
+        EXPECT_EQ(common.integerForKey("w2k7"), 7);
     }
-    for (auto& t : threads) {
-        t.join();
-    }
-    FilePreferenceStore reader(path);
-    EXPECT_EQ(reader.allKeys().size(), static_cast<std::size_t>(kWriters * kKeys));
 }
 
 TEST_F(FilePreferenceStoreTest, CorruptDomainIsReportedReadAsEmptyAndKeptUntilTheNextWrite) {
