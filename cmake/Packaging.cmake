@@ -55,7 +55,8 @@ set(CPACK_DEBIAN_FILE_NAME DEB-DEFAULT)
 set(CPACK_DEBIAN_PACKAGE_SECTION utils)
 set(CPACK_DEBIAN_PACKAGE_SHLIBDEPS ON)
 # The agent trusts the system's CAs for the coverage service; the units need the service manager.
-set(CPACK_DEBIAN_PACKAGE_DEPENDS "ca-certificates")
+# libcurl is loaded on first use (dlopen), so dpkg-shlibdeps cannot see it: it is named here.
+set(CPACK_DEBIAN_PACKAGE_DEPENDS "ca-certificates, libcurl4 (>= 7.88)")
 set(CPACK_DEBIAN_PACKAGE_RECOMMENDS "systemd")
 set(CPACK_DEBIAN_PACKAGE_CONTROL_EXTRA
     ${PROJECT_SOURCE_DIR}/share/debian/postinst

@@ -1,6 +1,7 @@
-// The daemon's queues on Asio: the main queue is an io_context run by the main thread,
-// the background queue is a thread pool, serial queues are strands on that pool, and
-// blocking work gets a pool of its own. Thread-safe.
+// The daemon's queues on Asio: the main queue is an io_context run by the main thread, the
+// background queue is a thread pool, serial queues are strands on that pool, blocking work
+// gets a pool of its own (started on first use), and client sockets live on I/O threads,
+// each running its own io_context. Thread-safe.
 #pragma once
 
 #include <asio/any_io_executor.hpp>
@@ -11,14 +12,14 @@
 
 namespace asio {
 class io_context;
-class thread_pool;
 }  // namespace asio
 
 namespace qax {
 
 class AsioDispatcher : public Dispatcher, public std::enable_shared_from_this<AsioDispatcher> {
   public:
-    explicit AsioDispatcher(unsigned backgroundThreads = 4, unsigned blockingThreads = 16);
+    // A count of 0 sizes the pool (and the I/O threads) to the machine's cores.
+    explicit AsioDispatcher(unsigned backgroundThreads = 0, unsigned blockingThreads = 16);
     ~AsioDispatcher() override;
 
     std::shared_ptr<TaskRunner> mainQueue() override { return main_; }
@@ -27,7 +28,10 @@ class AsioDispatcher : public Dispatcher, public std::enable_shared_from_this<As
     std::shared_ptr<TaskRunner> blockingQueue() override { return blocking_; }
 
     // A serial queue that I/O objects can also be bound to: socket completions and queued
-    // tasks then run one at a time on the same strand, without hopping between threads.
+    // tasks then run one at a time on the same strand. Each strand lives on one I/O thread
+    // (handed out in turn), whose single-threaded loop waits for the socket and runs its
+    // handlers itself, so a request is read, served and answered without waking any other
+    // thread. Work queued there must not block. The I/O threads start with the first strand.
     struct IoStrand {
         asio::any_io_executor executor;
         std::shared_ptr<TaskRunner> queue;
@@ -38,8 +42,11 @@ class AsioDispatcher : public Dispatcher, public std::enable_shared_from_this<As
     // Runs the main queue on the calling thread until stopMainLoop().
     void runMainLoop();
     void stopMainLoop();
-    // Stops accepting work and joins the pools.
+    // Stops accepting work and joins the pools and I/O threads.
     void shutdown();
+
+    // The machine's cores (at least 1).
+    static unsigned hardwareThreads();
 
   private:
     struct State;

@@ -4,12 +4,14 @@
 #include <sys/time.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <cctype>
+#include <cerrno>
 #include <cinttypes>
 #include <cstdio>
 #include <cstdlib>
+#include <cstring>
 #include <ctime>
-#include <iostream>
 
 namespace qax {
 
@@ -267,22 +269,107 @@ std::string StderrLogSink::formatLine(LogLevel level, std::string_view subsystem
     return line;
 }
 
-void StderrLogSink::write(LogLevel level, std::string_view subsystem, std::string_view category,
-                          std::string_view message) {
-    char stamp[64] = "";
-    if (!journal_) {
-        timeval tv{};
-        gettimeofday(&tv, nullptr);
+namespace {
+
+// Beyond this much held text a batch is written out early.
+constexpr std::size_t kMaxHeldBytes = 64 * 1024;
+
+struct HeldLines {
+    int depth = 0;
+    std::string text;
+};
+
+HeldLines& heldLines() {
+    thread_local HeldLines held;
+    return held;
+}
+
+void writeHeldLines(HeldLines& held) {
+    if (held.text.empty()) {
+        return;
+    }
+    StderrLogSink::writeToStderr(held.text);
+    held.text.clear();
+    if (held.text.capacity() > kMaxHeldBytes) {
+        std::string().swap(held.text);
+    }
+}
+
+constexpr std::size_t kTimestampBytes = 32;
+
+// "YYYY-MM-DD hh:mm:ss.mmm" in local time, into `out`. The part up to the seconds is made once
+// a second per thread: formatting the time is most of what a short line costs.
+std::string_view formatTimestamp(char (&out)[kTimestampBytes]) {
+    timeval tv{};
+    gettimeofday(&tv, nullptr);
+    struct Cached {
+        time_t second = -1;
+        char text[kTimestampBytes] = "";
+        std::size_t length = 0;
+    };
+    thread_local Cached cached;
+    if (cached.second != tv.tv_sec) {
         std::tm tm{};
         localtime_r(&tv.tv_sec, &tm);
-        std::snprintf(stamp, sizeof stamp, "%04d-%02d-%02d %02d:%02d:%02d.%03ld", tm.tm_year + 1900,
-                      tm.tm_mon + 1, tm.tm_mday, tm.tm_hour, tm.tm_min, tm.tm_sec,
-                      static_cast<long>(tv.tv_usec / 1000));
+        const int n = std::snprintf(cached.text, sizeof cached.text,
+                                    "%04d-%02d-%02d %02d:%02d:%02d", tm.tm_year + 1900,
+                                    tm.tm_mon + 1, tm.tm_mday, tm.tm_hour, tm.tm_min, tm.tm_sec);
+        cached.length = n > 0 ? std::min(static_cast<std::size_t>(n), sizeof cached.text - 1) : 0;
+        cached.second = tv.tv_sec;
     }
-    const std::string line = formatLine(level, subsystem, category, message, stamp, journal_);
-    std::lock_guard lock(mutex_);
-    std::fwrite(line.data(), 1, line.size(), stderr);
-    std::fflush(stderr);
+    const auto ms = static_cast<int>(tv.tv_usec / 1000);
+    std::size_t n = std::min(cached.length, kTimestampBytes - 5);
+    std::memcpy(out, cached.text, n);
+    out[n++] = '.';
+    out[n++] = static_cast<char>('0' + ms / 100);
+    out[n++] = static_cast<char>('0' + ms / 10 % 10);
+    out[n++] = static_cast<char>('0' + ms % 10);
+    return std::string_view(out, n);
+}
+
+}  // namespace
+
+void StderrLogSink::writeToStderr(std::string_view bytes) {
+    // No lock: one write() puts a whole buffer of lines at the end of a file or into the
+    // journal's socket at once, and two threads' buffers do not mix. Only a short write (a full
+    // disk) could let another thread's lines in between the pieces.
+    while (!bytes.empty()) {
+        const ssize_t n = ::write(STDERR_FILENO, bytes.data(), bytes.size());
+        if (n < 0 && errno == EINTR) {
+            continue;
+        }
+        if (n <= 0) {
+            return;  // nowhere to log to
+        }
+        bytes.remove_prefix(static_cast<std::size_t>(n));
+    }
+}
+
+void StderrLogSink::write(LogLevel level, std::string_view subsystem, std::string_view category,
+                          std::string_view message) {
+    char buffer[kTimestampBytes];
+    const std::string_view stamp = journal_ ? std::string_view() : formatTimestamp(buffer);
+    HeldLines& held = heldLines();
+    if (held.depth == 0) {
+        writeToStderr(formatLine(level, subsystem, category, message, stamp, journal_));
+        return;
+    }
+    held.text += formatLine(level, subsystem, category, message, stamp, journal_);
+    // An error goes out at once, with what led to it: the process may be about to end.
+    if (level == LogLevel::Error || held.text.size() > kMaxHeldBytes) {
+        writeHeldLines(held);
+    }
+}
+
+LogBatch::LogBatch() {
+    ++heldLines().depth;
+}
+
+LogBatch::~LogBatch() {
+    HeldLines& held = heldLines();
+    if (--held.depth == 0) {
+        writeHeldLines(held);
+    }
 }
 
 void CapturingLogSink::write(LogLevel level, std::string_view, std::string_view,

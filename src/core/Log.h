@@ -170,6 +170,18 @@ inline constexpr const char* kLogCategory = "core";
 // The shared log handle, created once on first use (bound to a stderr sink until rebound).
 Log& qaxLog();
 
+// Lines this thread writes to a StderrLogSink while a LogBatch lives are held and written
+// together, with one system call, when the outermost batch ends; an error line is written at
+// once, with what is held. For bounded work that never waits (serving a request), so that its
+// lines cost one write, made after its reply. Each line keeps the time it was logged at.
+class LogBatch {
+  public:
+    LogBatch();
+    ~LogBatch();
+    LogBatch(const LogBatch&) = delete;
+    LogBatch& operator=(const LogBatch&) = delete;
+};
+
 // One line per message on stderr: time, level, subsystem:category, message. Reads
 // QAX_LOG_LEVEL ("debug" shows debug lines) and QAX_LOG_PRIVATE ("1" shows private values).
 // When stderr is the journal's stream (JOURNAL_STREAM names it), a line starts with the
@@ -191,12 +203,13 @@ class StderrLogSink : public LogSink {
                                   std::string_view time, bool journal);
     // Whether `fd` is the stream JOURNAL_STREAM ("device:inode") names.
     static bool isJournalStream(const char* journalStream, int fd);
+    // Writes `bytes` to stderr with one write() where it can.
+    static void writeToStderr(std::string_view bytes);
 
   private:
     bool debug_ = false;
     bool private_ = false;
     bool journal_ = false;
-    std::mutex mutex_;
 };
 
 // Keeps every message in memory, for tests to assert on.

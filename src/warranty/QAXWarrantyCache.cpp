@@ -2,9 +2,16 @@
 // serial number's digest) under the home directory, the legacy single-file cache of earlier
 // releases, and the one-time move from the one to the other. Files are replaced atomically
 // (written aside, flushed, renamed, directory flushed), so a reader sees the old file or the
-// new one. No lock of its own; any thread.
+// new one. A cache file is parsed once per change: what was parsed is kept by path with the
+// file's identity, size and times, and used while a stat() finds them unchanged, so the file
+// stays the truth. Any thread (the parsed files are behind a mutex).
+#include <sys/stat.h>
+
+#include <ctime>
 #include <filesystem>
+#include <mutex>
 #include <system_error>
+#include <unordered_map>
 
 #include "core/AtomicFile.h"
 #include "core/Hash.h"
@@ -45,18 +52,94 @@ std::string pathForSerialNumber(const Platform& platform,
                         sha256Hash(*serialNumber));
 }
 
-// The file's root dictionary; none for a missing, unreadable or malformed file or any other
-// root.
+// Parsed cache files by path. Few devices are ever cached, so the table stays small; past the
+// bound it starts again.
+class ParsedFiles {
+  public:
+    // The file's root dictionary; none for a missing, unreadable or malformed file or any
+    // other root.
+    std::optional<Value> read(const std::string& path) {
+        struct stat st {};
+        if (::stat(path.c_str(), &st) != 0) {
+            forget(path);
+            return std::nullopt;
+        }
+        const Identity identity = identityOf(st);
+        {
+            std::lock_guard lock(mutex_);
+            if (auto it = files_.find(path);
+                it != files_.end() && it->second.settled && it->second.identity == identity) {
+                return it->second.value;
+            }
+        }
+        // Read after the stat: a file replaced in between is newer than the identity kept
+        // with it, so the next stat sees the change and reads it again.
+        const long long readNs = realTimeNs();
+        std::optional<Value> value;
+        if (auto bytes = readWholeFile(path, kMaxPlistBytes)) {
+            value = parsePlist(*bytes);
+            if (value && !value->isDictionary()) {
+                value.reset();
+            }
+        }
+        std::lock_guard lock(mutex_);
+        if (files_.size() >= kMaxFiles) {
+            files_.clear();
+        }
+        // File times advance in clock ticks: a file changed within a tick of this read could
+        // change again without its times moving, so it is parsed again until it is older.
+        const bool settled = readNs - identity.modifiedNs > kTimeGranularityNs &&
+                             readNs - identity.changedNs > kTimeGranularityNs;
+        files_.insert_or_assign(path, Parsed{identity, settled, value});
+        return value;
+    }
+
+    // Called after this process has written or removed the file.
+    void forget(const std::string& path) {
+        std::lock_guard lock(mutex_);
+        files_.erase(path);
+    }
+
+  private:
+    struct Identity {
+        dev_t device = 0;
+        ino_t inode = 0;
+        off_t size = 0;
+        long long modifiedNs = 0;
+        long long changedNs = 0;
+        bool operator==(const Identity&) const = default;
+    };
+    struct Parsed {
+        Identity identity;
+        bool settled = false;
+        std::optional<Value> value;
+    };
+    static constexpr std::size_t kMaxFiles = 64;
+    // Coarser than any file system's timestamp tick.
+    static constexpr long long kTimeGranularityNs = 50'000'000;
+
+    static long long toNs(const timespec& t) { return t.tv_sec * 1'000'000'000LL + t.tv_nsec; }
+    static Identity identityOf(const struct stat& st) {
+        return {st.st_dev, st.st_ino, st.st_size, toNs(st.st_mtim), toNs(st.st_ctim)};
+    }
+    // The file system's clock, not the agent's: file times are compared with it.
+    static long long realTimeNs() {
+        timespec now{};
+        clock_gettime(CLOCK_REALTIME, &now);
+        return toNs(now);
+    }
+
+    std::mutex mutex_;
+    std::unordered_map<std::string, Parsed> files_;
+};
+
+ParsedFiles& parsedFiles() {
+    static ParsedFiles files;
+    return files;
+}
+
 std::optional<Value> readDictionary(const std::string& path) {
-    auto bytes = readWholeFile(path, kMaxPlistBytes);
-    if (!bytes) {
-        return std::nullopt;
-    }
-    auto value = parsePlist(*bytes);
-    if (!value || !value->isDictionary()) {
-        return std::nullopt;
-    }
-    return value;
+    return parsedFiles().read(path);
 }
 
 }  // namespace
@@ -76,7 +159,9 @@ bool QAXWarranty::cacheWarranty(const std::optional<std::string>& serialNumber) 
     fs::create_directories(fs::path(path).parent_path(), ignored);
     auto xml = toXmlPlist(dictionaryRepresentation());
     std::string error = "the summary has no property-list form";
-    if (!xml || !writeFileAtomically(path, *xml, &error)) {
+    const bool written = xml && writeFileAtomically(path, *xml, &error);
+    parsedFiles().forget(path);
+    if (!written) {
         qaxLog().error("Unable to write the warranty cache %@: %@", path, error);
         return false;
     }
@@ -114,6 +199,7 @@ std::shared_ptr<QAXWarranty> QAXWarranty::migrateLegacyCachedWarrantyIfNeededFor
     }
     std::error_code ignored;
     fs::remove(legacyPath, ignored);
+    parsedFiles().forget(legacyPath);
     return warranty;
 }
 

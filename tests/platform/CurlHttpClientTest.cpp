@@ -9,6 +9,7 @@
 #include <mutex>
 #include <set>
 #include <thread>
+#include <vector>
 
 #include "fakes/FakeServices.h"
 #include "fakes/TestHttpsServer.h"
@@ -107,6 +108,49 @@ TEST(CurlHttpClientTest, RunsTransfersConcurrentlyAndCompletesEachOnceOnTheSessi
     EXPECT_EQ(gate.maxInFlight(), kTransfers);
     EXPECT_EQ(threads.size(), 1u);
     EXPECT_FALSE(threads.contains(std::this_thread::get_id()));
+}
+
+TEST(CurlHttpClientTest, CompletionsRunOnTheCompletionQueueWhenOneIsGiven) {
+    // Holds what is posted until the test runs it.
+    struct HeldQueue : TaskRunner {
+        std::mutex mutex;
+        std::condition_variable posted;
+        std::vector<Task> tasks;
+        void post(Task task) override {
+            std::lock_guard<std::mutex> lock(mutex);
+            tasks.push_back(std::move(task));
+            posted.notify_all();
+        }
+        void postDelayed(Task task, double) override { post(std::move(task)); }
+    };
+    TestHttpsServer server;
+    server.server().Get("/ok", [](const httplib::Request&, httplib::Response& res) {
+        res.set_content("ok", "text/plain");
+    });
+    server.start();
+    auto queue = std::make_shared<HeldQueue>();
+    auto options = trusting(server);
+    options.completionQueue = queue;
+    CurlHttpClient client(options);
+
+    std::atomic<int> completions = 0;
+    std::string body;
+    client.send(HttpRequest(server.url("/ok")), [&](HttpResult r) {
+        body = r.response ? r.response->body : r.error;
+        ++completions;
+    });
+    std::vector<Task> tasks;
+    {
+        std::unique_lock<std::mutex> lock(queue->mutex);
+        ASSERT_TRUE(queue->posted.wait_for(lock, 20s, [&] { return !queue->tasks.empty(); }));
+        tasks.swap(queue->tasks);
+    }
+    EXPECT_EQ(completions, 0);
+    for (auto& task : tasks) {
+        task();
+    }
+    EXPECT_EQ(completions, 1);
+    EXPECT_EQ(body, "ok");
 }
 
 TEST(CurlHttpClientTest, TransportFailuresComeBackAsErrors) {

@@ -3,9 +3,11 @@
 #include <filesystem>
 #include <thread>
 
+#include "core/FileSnapshotScope.h"
 #include "core/PlistCodec.h"
 #include "fakes/TestPlatform.h"
 #include "platform/QAXSettings.h"
+#include "platform/host/CachedPlistFile.h"
 #include "platform/host/FilePreferenceStore.h"
 
 namespace qax {
@@ -92,22 +94,64 @@ TEST_F(FilePreferenceStoreTest, AnotherProcessWritesAreSeenOnTheNextRead) {
     EXPECT_EQ(agent.allKeys(), std::vector<std::string>{"PostUpgradeActivityCompleted"});
 }
 
-TEST_F(FilePreferenceStoreTest, ConcurrentWritersLoseNoKey) {
+TEST_F(FilePreferenceStoreTest, WithinASnapshotScopeFilesAreLookedAtOnce) {
+    // One piece of work (a request) sees each file as at its first look; the next sees edits.
+    FilePreferenceStore agent(path), engineer(path);
+    const std::string device = env.home.str() + "/device.plist";
+    CachedPlistFile deviceFile(device);
+    ASSERT_TRUE(engineer.setObject("SerialNumber", Value("FIRST")));
+    writeFile(device, *toXmlPlist(Value(Value::Dictionary{{"SerialNumber", "FIRST"}})));
+    auto serials = [&] {
+        auto root = deviceFile.read();
+        const Value* serial = root ? root->find("SerialNumber") : nullptr;
+        return std::make_pair(agent.stringForKey("SerialNumber").value_or(""),
+                              serial ? *serial->asString() : "");
+    };
+    {
+        FileSnapshotScope request;
+        EXPECT_EQ(serials(), std::make_pair(std::string("FIRST"), std::string("FIRST")));
+        ASSERT_TRUE(engineer.setObject("SerialNumber", Value("SECOND")));
+        writeFile(device, *toXmlPlist(Value(Value::Dictionary{{"SerialNumber", "SECOND"}})));
+        EXPECT_EQ(serials(), std::make_pair(std::string("FIRST"), std::string("FIRST")));
+        // The store's own writes are seen at once.
+        ASSERT_TRUE(agent.setObject("SerialNumber", Value("OWN")));
+        EXPECT_EQ(agent.stringForKey("SerialNumber"), "OWN");
+    }
+    ASSERT_TRUE(engineer.setObject("SerialNumber", Value("THIRD")));
+    EXPECT_EQ(serials(), std::make_pair(std::string("THIRD"), std::string("SECOND")));
+    FileSnapshotScope next;
+    EXPECT_EQ(serials(), std::make_pair(std::string("THIRD"), std::string("SECOND")));
+}
+
+TEST_F(FilePreferenceStoreTest, ConcurrentWritersAndReadersLoseNoKey) {
     constexpr int kWriters = 4, kKeys = 25;
-    std::vector<std::thread> threads;
-    for (int w = 0; w < kWriters; ++w) {
-        threads.emplace_back([&, w] {
-            FilePreferenceStore store(path);  // each thread its own view, like separate processes
-            for (int k = 0; k < kKeys; ++k) {
-                store.setObject("w" + std::to_string(w) + "k" + std::to_string(k), Value(k));
-            }
-        });
+    // Threads of one store share writes; separate stores behave like separate processes.
+    for (const bool shared : {true, false}) {
+        std::filesystem::remove(path);
+        FilePreferenceStore common(path);
+        std::vector<std::thread> threads;
+        for (int w = 0; w <= kWriters; ++w) {
+            threads.emplace_back([&, w] {
+                FilePreferenceStore own(path);
+                FilePreferenceStore& store = shared ? common : own;
+                for (int k = 0; k < kKeys; ++k) {
+                    if (w == kWriters) {  // a reader, in the writers' way
+                        store.objectForKey("w0k0");
+                    } else {
+                        EXPECT_TRUE(store.setObject(
+                            "w" + std::to_string(w) + "k" + std::to_string(k), Value(k)));
+                    }
+                }
+            });
+        }
+        for (auto& t : threads) {
+            t.join();
+        }
+        FilePreferenceStore reader(path);
+        EXPECT_EQ(reader.allKeys().size(), static_cast<std::size_t>(kWriters * kKeys)) << shared;
+        EXPECT_EQ(reader.integerForKey("w3k24"), 24);
+        EXPECT_EQ(common.integerForKey("w2k7"), 7);
     }
-    for (auto& t : threads) {
-        t.join();
-    }
-    FilePreferenceStore reader(path);
-    EXPECT_EQ(reader.allKeys().size(), static_cast<std::size_t>(kWriters * kKeys));
 }
 
 TEST_F(FilePreferenceStoreTest, CorruptDomainIsReportedReadAsEmptyAndKeptUntilTheNextWrite) {

@@ -3,6 +3,7 @@
 #include <filesystem>
 #include <regex>
 
+#include "core/AtomicFile.h"
 #include "core/Hash.h"
 #include "core/PlistCodec.h"
 #include "fakes/FakeServices.h"
@@ -117,6 +118,32 @@ TEST_F(QAXWarrantyCacheTest, FileContentThatIsNoRecord) {
         if (read) {
             EXPECT_EQ(read->dictionaryRepresentation(), summary("binary"));
         }
+    }
+}
+
+TEST_F(QAXWarrantyCacheTest, EditsOnDiskAreSeenByTheNextRead) {
+    // Same-size contents, written right after a read: neither the size nor (within a clock
+    // tick) the file times need to move.
+    const fs::path file = cacheDirectory() / (sha256Hash("S") + "_Warranty.plist");
+    struct Row {
+        const char* name;
+        bool inPlace;
+    } rows[] = {{"rewritten in place", true}, {"replaced by rename", false}};
+    for (const auto& row : rows) {
+        SCOPED_TRACE(row.name);
+        make(summary("aaaa"))->cacheWarranty("S");
+        ASSERT_EQ(QAXWarranty::cachedWarrantyForSerialNumber(tp.platform, "S")
+                      ->dictionaryRepresentation(),
+                  summary("aaaa"));
+        const std::string next = *toXmlPlist(summary("bbbb"));
+        if (row.inPlace) {
+            test::writeFile(file, next);
+        } else {
+            ASSERT_TRUE(writeFileAtomically(file.string(), next));
+        }
+        EXPECT_EQ(QAXWarranty::cachedWarrantyForSerialNumber(tp.platform, "S")
+                      ->dictionaryRepresentation(),
+                  summary("bbbb"));
     }
 }
 

@@ -1,11 +1,12 @@
 // A property-list file of the platform root (device.plist, features.plist, ...), parsed
 // once per change: the file is re-read only when its identity or modification time
 // changes, and the file on disk stays the truth. A missing or malformed file reads as
-// none. Thread-safe.
+// none. Within a FileSnapshotScope the file is looked at once. Thread-safe.
 #pragma once
 
 #include <sys/types.h>
 
+#include <cstdint>
 #include <mutex>
 #include <optional>
 #include <string>
@@ -30,6 +31,8 @@ class CachedPlistFile {
     off_t size_ = -1;
     long long mtimeNs_ = -1;
     std::optional<Value> value_;
+    // The FileSnapshotScope in which the file was last looked at.
+    std::uint64_t checkedInScope_ = 0;
 };
 
 }  // namespace qax

@@ -1,6 +1,5 @@
 #include "platform/host/CurlHttpClient.h"
 
-#include <curl/curl.h>
 #include <openssl/err.h>
 #include <openssl/pem.h>
 #include <openssl/ssl.h>
@@ -20,6 +19,7 @@
 
 #include "core/Log.h"
 #include "core/PlistCodec.h"
+#include "platform/host/CurlLibrary.h"
 
 namespace qax {
 namespace {
@@ -35,11 +35,6 @@ constexpr int kIdlePollMilliseconds = 1000;
 constexpr const char* kCancelledError = "The session was invalidated before the request completed";
 constexpr const char* kTooLargeError = "The response body exceeds the session's size limit";
 constexpr const char* kRequestTransaction = "HTTP request";
-
-void initializeCurlOnce() {
-    static std::once_flag once;
-    std::call_once(once, [] { curl_global_init(CURL_GLOBAL_DEFAULT); });
-}
 
 bool sameName(std::string_view a, std::string_view b) {
     return a.size() == b.size() && strncasecmp(a.data(), b.data(), a.size()) == 0;
@@ -118,7 +113,7 @@ std::vector<X509*> readCertificates(const std::string& path) {
 // from under the running loop.
 class CurlHttpClient::Session : public std::enable_shared_from_this<Session> {
   public:
-    explicit Session(Options options);
+    Session(const CurlLibrary& curl, Options options);
     ~Session();
 
     void start();
@@ -127,6 +122,7 @@ class CurlHttpClient::Session : public std::enable_shared_from_this<Session> {
 
   private:
     struct Transfer {
+        const CurlLibrary* curl = nullptr;
         CURL* easy = nullptr;
         curl_slist* headerList = nullptr;
         HttpRequest request;
@@ -138,10 +134,10 @@ class CurlHttpClient::Session : public std::enable_shared_from_this<Session> {
 
         ~Transfer() {
             if (easy) {
-                curl_easy_cleanup(easy);
+                curl->easy_cleanup(easy);
             }
             if (headerList) {
-                curl_slist_free_all(headerList);
+                curl->slist_free_all(headerList);
             }
         }
     };
@@ -155,6 +151,8 @@ class CurlHttpClient::Session : public std::enable_shared_from_this<Session> {
     };
 
     void run();
+    // Runs `completion` where completions run.
+    void complete(std::function<void(HttpResult)> completion, HttpResult result);
     bool begin(Transfer& transfer);
     void finishCompleted();
     void finish(std::unique_ptr<Transfer> transfer, CURLcode code);
@@ -166,6 +164,7 @@ class CurlHttpClient::Session : public std::enable_shared_from_this<Session> {
     static std::size_t onHeader(char* data, std::size_t size, std::size_t count, void* user);
     static CURLcode onSslContext(CURL* easy, void* sslContext, void* user);
 
+    const CurlLibrary& curl_;
     const Options options_;
     std::vector<X509*> extraCAs_;
     CURLM* multi_ = nullptr;
@@ -181,20 +180,20 @@ class CurlHttpClient::Session : public std::enable_shared_from_this<Session> {
     std::unordered_map<CURL*, std::unique_ptr<Transfer>> active_;
 };
 
-CurlHttpClient::Session::Session(Options options) : options_(std::move(options)) {
-    initializeCurlOnce();
+CurlHttpClient::Session::Session(const CurlLibrary& curl, Options options)
+    : curl_(curl), options_(std::move(options)) {
     if (options_.extraCAFile) {
         extraCAs_ = readCertificates(*options_.extraCAFile);
         if (extraCAs_.empty()) {
             qaxLog().error("No CA certificate could be read from '%@'", *options_.extraCAFile);
         }
     }
-    multi_ = curl_multi_init();
+    multi_ = curl_.multi_init();
 }
 
 CurlHttpClient::Session::~Session() {
     if (multi_) {
-        curl_multi_cleanup(multi_);
+        curl_.multi_cleanup(multi_);
     }
     for (X509* cert : extraCAs_) {
         X509_free(cert);
@@ -211,7 +210,7 @@ void CurlHttpClient::Session::shutdown() {
         stopping_ = true;
     }
     if (multi_) {
-        curl_multi_wakeup(multi_);
+        curl_.multi_wakeup(multi_);
     }
     if (!thread_.joinable()) {
         return;
@@ -292,10 +291,22 @@ void CurlHttpClient::Session::send(const HttpRequest& request,
     }
     if (completion) {
         // The session is gone: there is no session thread left to answer on.
-        completion(HttpResult{std::nullopt, kCancelledError});
+        complete(std::move(completion), HttpResult{std::nullopt, kCancelledError});
         return;
     }
-    curl_multi_wakeup(multi_);
+    curl_.multi_wakeup(multi_);
+}
+
+void CurlHttpClient::Session::complete(std::function<void(HttpResult)> completion,
+                                       HttpResult result) {
+    if (options_.completionQueue) {
+        options_.completionQueue->post(
+            [completion = std::move(completion), result = std::move(result)]() mutable {
+                completion(std::move(result));
+            });
+        return;
+    }
+    completion(std::move(result));
 }
 
 void CurlHttpClient::Session::run() {
@@ -310,11 +321,11 @@ void CurlHttpClient::Session::run() {
             stopping = stopping_;
         }
         for (auto& r : ready) {
-            r.completion(std::move(r.result));
+            complete(std::move(r.completion), std::move(r.result));
         }
         if (stopping) {
             for (auto& t : toStart) {
-                t->completion(HttpResult{std::nullopt, kCancelledError});
+                complete(std::move(t->completion), HttpResult{std::nullopt, kCancelledError});
             }
             break;
         }
@@ -323,23 +334,25 @@ void CurlHttpClient::Session::run() {
                 CURL* easy = t->easy;
                 active_.emplace(easy, std::move(t));
             } else {
-                t->completion(HttpResult{std::nullopt, "The request could not be set up"});
+                complete(std::move(t->completion),
+                         HttpResult{std::nullopt, "The request could not be set up"});
             }
         }
         int running = 0;
-        curl_multi_perform(multi_, &running);
+        curl_.multi_perform(multi_, &running);
         finishCompleted();
-        curl_multi_poll(multi_, nullptr, 0, kIdlePollMilliseconds, nullptr);
+        curl_.multi_poll(multi_, nullptr, 0, kIdlePollMilliseconds, nullptr);
     }
     for (auto& [easy, transfer] : active_) {
-        curl_multi_remove_handle(multi_, easy);
-        transfer->completion(HttpResult{std::nullopt, kCancelledError});
+        curl_.multi_remove_handle(multi_, easy);
+        complete(std::move(transfer->completion), HttpResult{std::nullopt, kCancelledError});
     }
     active_.clear();
 }
 
 bool CurlHttpClient::Session::begin(Transfer& t) {
-    t.easy = curl_easy_init();
+    t.curl = &curl_;
+    t.easy = curl_.easy_init();
     if (!t.easy) {
         return false;
     }
@@ -350,65 +363,67 @@ bool CurlHttpClient::Session::begin(Transfer& t) {
     if (!(timeout > 0)) {
         timeout = kDefaultTimeoutSeconds;
     }
-    curl_easy_setopt(e, CURLOPT_URL, r.url().c_str());
-    curl_easy_setopt(e, CURLOPT_PRIVATE, &t);
-    curl_easy_setopt(e, CURLOPT_NOSIGNAL, 1L);
-    curl_easy_setopt(e, CURLOPT_ERRORBUFFER, t.errorBuffer);
-    curl_easy_setopt(e, CURLOPT_PROTOCOLS_STR, "http,https");
-    curl_easy_setopt(e, CURLOPT_REDIR_PROTOCOLS_STR, "http,https");
-    curl_easy_setopt(e, CURLOPT_FOLLOWLOCATION, 1L);
-    curl_easy_setopt(e, CURLOPT_MAXREDIRS, kMaxRedirects);
-    curl_easy_setopt(e, CURLOPT_TIMEOUT_MS, static_cast<long>(std::ceil(timeout * 1000)));
-    curl_easy_setopt(e, CURLOPT_ACCEPT_ENCODING, "");
-    curl_easy_setopt(e, CURLOPT_WRITEFUNCTION, &Session::onBody);
-    curl_easy_setopt(e, CURLOPT_WRITEDATA, &t);
-    curl_easy_setopt(e, CURLOPT_HEADERFUNCTION, &Session::onHeader);
-    curl_easy_setopt(e, CURLOPT_HEADERDATA, &t);
+    curl_.easy_setopt(e, CURLOPT_URL, r.url().c_str());
+    curl_.easy_setopt(e, CURLOPT_PRIVATE, &t);
+    curl_.easy_setopt(e, CURLOPT_NOSIGNAL, 1L);
+    curl_.easy_setopt(e, CURLOPT_ERRORBUFFER, t.errorBuffer);
+    curl_.easy_setopt(e, CURLOPT_PROTOCOLS_STR, "http,https");
+    curl_.easy_setopt(e, CURLOPT_REDIR_PROTOCOLS_STR, "http,https");
+    curl_.easy_setopt(e, CURLOPT_FOLLOWLOCATION, 1L);
+    curl_.easy_setopt(e, CURLOPT_MAXREDIRS, kMaxRedirects);
+    curl_.easy_setopt(e, CURLOPT_TIMEOUT_MS, static_cast<long>(std::ceil(timeout * 1000)));
+    curl_.easy_setopt(e, CURLOPT_ACCEPT_ENCODING, "");
+    curl_.easy_setopt(e, CURLOPT_WRITEFUNCTION, &Session::onBody);
+    curl_.easy_setopt(e, CURLOPT_WRITEDATA, &t);
+    curl_.easy_setopt(e, CURLOPT_HEADERFUNCTION, &Session::onHeader);
+    curl_.easy_setopt(e, CURLOPT_HEADERDATA, &t);
     if (!extraCAs_.empty()) {
-        curl_easy_setopt(e, CURLOPT_SSL_CTX_FUNCTION, &Session::onSslContext);
-        curl_easy_setopt(e, CURLOPT_SSL_CTX_DATA, this);
-        // The extra CAs go into each connection's own store, never into a shared one.
-        curl_easy_setopt(e, CURLOPT_CA_CACHE_TIMEOUT, 0L);
+        curl_.easy_setopt(e, CURLOPT_SSL_CTX_FUNCTION, &Session::onSslContext);
+        curl_.easy_setopt(e, CURLOPT_SSL_CTX_DATA, this);
+        // The store the callback adds them to is the session's cached one (libcurl keeps the
+        // system CAs it read, per multi handle): reading the system bundle again for every
+        // connection costs milliseconds each, and every request of the session trusts the
+        // extra CAs anyway.
     }
 
     for (const auto& [name, value] : r.headers()) {
-        t.headerList = curl_slist_append(t.headerList, (name + ": " + value).c_str());
+        t.headerList = curl_.slist_append(t.headerList, (name + ": " + value).c_str());
     }
     if (!r.valueForHeader("Expect")) {
         // Bodies go out at once rather than after a second's wait for "100 Continue".
-        t.headerList = curl_slist_append(t.headerList, "Expect:");
+        t.headerList = curl_.slist_append(t.headerList, "Expect:");
     }
-    curl_easy_setopt(e, CURLOPT_HTTPHEADER, t.headerList);
+    curl_.easy_setopt(e, CURLOPT_HTTPHEADER, t.headerList);
 
     const std::string& method = r.method();
     if (method == "GET" || method.empty()) {
-        curl_easy_setopt(e, CURLOPT_HTTPGET, 1L);
+        curl_.easy_setopt(e, CURLOPT_HTTPGET, 1L);
     } else if (method == "HEAD") {
-        curl_easy_setopt(e, CURLOPT_NOBODY, 1L);
+        curl_.easy_setopt(e, CURLOPT_NOBODY, 1L);
     } else {
         if (method == "POST") {
-            curl_easy_setopt(e, CURLOPT_POST, 1L);
+            curl_.easy_setopt(e, CURLOPT_POST, 1L);
         } else {
-            curl_easy_setopt(e, CURLOPT_CUSTOMREQUEST, method.c_str());
+            curl_.easy_setopt(e, CURLOPT_CUSTOMREQUEST, method.c_str());
         }
         const std::string body = r.body().value_or(std::string());
         if (r.body() || method == "POST") {
-            curl_easy_setopt(e, CURLOPT_POSTFIELDSIZE_LARGE, static_cast<curl_off_t>(body.size()));
-            curl_easy_setopt(e, CURLOPT_COPYPOSTFIELDS, body.c_str());
+            curl_.easy_setopt(e, CURLOPT_POSTFIELDSIZE_LARGE, static_cast<curl_off_t>(body.size()));
+            curl_.easy_setopt(e, CURLOPT_COPYPOSTFIELDS, body.c_str());
         }
     }
-    return curl_multi_add_handle(multi_, e) == CURLM_OK;
+    return curl_.multi_add_handle(multi_, e) == CURLM_OK;
 }
 
 void CurlHttpClient::Session::finishCompleted() {
     int left = 0;
-    while (CURLMsg* message = curl_multi_info_read(multi_, &left)) {
+    while (CURLMsg* message = curl_.multi_info_read(multi_, &left)) {
         if (message->msg != CURLMSG_DONE) {
             continue;
         }
         CURL* easy = message->easy_handle;
         const CURLcode code = message->data.result;
-        curl_multi_remove_handle(multi_, easy);
+        curl_.multi_remove_handle(multi_, easy);
         auto it = active_.find(easy);
         if (it == active_.end()) {
             continue;
@@ -423,21 +438,21 @@ void CurlHttpClient::Session::finish(std::unique_ptr<Transfer> t, CURLcode code)
     HttpResult result;
     if (code == CURLE_OK) {
         long status = 0;
-        curl_easy_getinfo(t->easy, CURLINFO_RESPONSE_CODE, &status);
+        curl_.easy_getinfo(t->easy, CURLINFO_RESPONSE_CODE, &status);
         t->response.statusCode = status;
         storeInCache(t->request, t->response);
         result.response = std::move(t->response);
     } else if (t->tooLarge) {
         result.error = kTooLargeError;
     } else {
-        result.error = curl_easy_strerror(code);
+        result.error = curl_.easy_strerror(code);
         if (t->errorBuffer[0]) {
             result.error += std::string(": ") + t->errorBuffer;
         }
     }
     auto completion = std::move(t->completion);
     t.reset();
-    completion(std::move(result));
+    complete(std::move(completion), std::move(result));
 }
 
 std::size_t CurlHttpClient::Session::onBody(char* data, std::size_t size, std::size_t count,
@@ -478,7 +493,8 @@ CURLcode CurlHttpClient::Session::onSslContext(CURL*, void* sslContext, void* us
         return CURLE_SSL_CERTPROBLEM;
     }
     for (X509* cert : session->extraCAs_) {
-        X509_STORE_add_cert(store, cert);  // a certificate already there is not an error
+        // A certificate already there (from an earlier connection) is not an error.
+        X509_STORE_add_cert(store, cert);
     }
     ERR_clear_error();
     return CURLE_OK;
@@ -513,23 +529,56 @@ CurlHttpClient::Options CurlHttpClient::optionsForPlatformRoot(const std::string
 
 CurlHttpClient::CurlHttpClient() : CurlHttpClient(Options{}) {}
 
-CurlHttpClient::CurlHttpClient(Options options)
-    : lifecycle_(options.lifecycle), session_(std::make_shared<Session>(std::move(options))) {
-    session_->start();
-}
+CurlHttpClient::CurlHttpClient(Options options) : options_(std::move(options)) {}
 
 CurlHttpClient::~CurlHttpClient() {
-    session_->shutdown();
+    std::shared_ptr<Session> session;
+    {
+        std::lock_guard lock(mutex_);
+        sessionTried_ = true;
+        sessionError_ = kCancelledError;
+        session = std::move(session_);
+    }
+    if (session) {
+        session->shutdown();
+    }
+}
+
+std::shared_ptr<CurlHttpClient::Session> CurlHttpClient::session(std::string* error) {
+    std::lock_guard lock(mutex_);
+    if (!sessionTried_) {
+        sessionTried_ = true;
+        if (const CurlLibrary* curl = CurlLibrary::get(&sessionError_)) {
+            session_ = std::make_shared<Session>(*curl, options_);
+            session_->start();
+        }
+    }
+    if (!session_) {
+        *error = sessionError_;
+    }
+    return session_;
 }
 
 void CurlHttpClient::send(const HttpRequest& request, std::function<void(HttpResult)> completion) {
-    if (lifecycle_) {
+    if (options_.lifecycle) {
         // Let go once the completion has run and been dropped.
         completion = [completion = std::move(completion),
-                      transaction = lifecycle_->beginTransaction(kRequestTransaction)](
+                      transaction = options_.lifecycle->beginTransaction(kRequestTransaction)](
                          HttpResult result) { completion(std::move(result)); };
     }
-    session_->send(request, std::move(completion));
+    std::string error;
+    if (auto s = session(&error)) {
+        s->send(request, std::move(completion));
+        return;
+    }
+    qaxLog().error("No HTTP session: %@", error);
+    if (options_.completionQueue) {
+        options_.completionQueue->post([completion = std::move(completion), error]() {
+            completion(HttpResult{std::nullopt, error});
+        });
+        return;
+    }
+    completion(HttpResult{std::nullopt, error});
 }
 
 }  // namespace qax

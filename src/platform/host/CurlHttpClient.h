@@ -1,18 +1,23 @@
 // The host's HTTPS session: one libcurl multi handle driven by a thread of its own, many
 // transfers at once, a small in-memory cache for GET answers that allow it, and trust of an
-// extra CA (tls.plist "ExtraCAFile") next to the system CAs. send() may be called from any
-// thread, completions included; every completion runs once, on the session's thread.
-// Destroying the session cancels what is outstanding (each completion gets an error). Each
-// outstanding request holds a transaction of the process lifecycle, when one is given.
+// extra CA (tls.plist "ExtraCAFile") next to the system CAs. Nothing starts before the first
+// request: libcurl is loaded, TLS initialised and the thread started then. send() may be
+// called from any thread, completions included; every completion runs once, on the completion
+// queue when one is given (so that what a completion does, such as writing files, never holds
+// up the transfers), else on the session's thread. Destroying the session cancels what is
+// outstanding (each completion gets an error). Each outstanding request holds a transaction of
+// the process lifecycle, when one is given.
 #pragma once
 
 #include <cstddef>
 #include <functional>
 #include <memory>
+#include <mutex>
 #include <optional>
 #include <string>
 
 #include "core/Clock.h"
+#include "core/TaskRunner.h"
 #include "platform/HttpClient.h"
 #include "platform/ProcessLifecycle.h"
 
@@ -33,6 +38,8 @@ class CurlHttpClient : public HttpClient {
         std::shared_ptr<Clock> clock;
         // Kept from exiting while a request is outstanding; none in tools.
         std::shared_ptr<ProcessLifecycle> lifecycle;
+        // Where completions run; none: on the session's thread.
+        std::shared_ptr<TaskRunner> completionQueue;
     };
 
     // The platform root's tls.plist decides the extra CA (a relative path is taken from the
@@ -50,7 +57,14 @@ class CurlHttpClient : public HttpClient {
     class Session;
 
   private:
-    std::shared_ptr<ProcessLifecycle> lifecycle_;
+    // The session, made and started on first use; none when libcurl cannot be loaded (the
+    // reason in `error`) or the client is being destroyed.
+    std::shared_ptr<Session> session(std::string* error);
+
+    const Options options_;
+    std::mutex mutex_;
+    bool sessionTried_ = false;
+    std::string sessionError_;
     std::shared_ptr<Session> session_;
 };
 

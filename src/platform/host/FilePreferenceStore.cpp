@@ -8,6 +8,7 @@
 #include <filesystem>
 
 #include "core/AtomicFile.h"
+#include "core/FileSnapshotScope.h"
 #include "core/Log.h"
 #include "core/PlistCodec.h"
 
@@ -91,6 +92,11 @@ Value::Dictionary FilePreferenceStore::loadLocked(const FileIdentity& identity) 
 }
 
 void FilePreferenceStore::refreshLocked() {
+    const std::uint64_t scope = FileSnapshotScope::current();
+    if (loadedOnce_ && scope != 0 && scope == checkedInScope_) {
+        return;  // looked at already during this piece of work
+    }
+    checkedInScope_ = scope;
     FileIdentity id = currentIdentity();
     if (loadedOnce_ && id == loaded_) {
         return;
@@ -122,36 +128,71 @@ std::optional<Value> FilePreferenceStore::objectForKey(std::string_view key) {
 }
 
 bool FilePreferenceStore::modify(std::string_view key, const Value* value) {
-    std::lock_guard lock(mutex_);
-    FileLock fileLock(path_ + ".lock", LOCK_EX);
-    // Start from the file as it is now, not from what this process read earlier, so that
-    // another writer's keys survive.
-    FileIdentity id = currentIdentity();
-    Value::Dictionary next = loadLocked(id);
-    if (value) {
-        next.insert_or_assign(std::string(key), *value);
-    } else {
-        auto it = next.find(key);
-        if (it == next.end()) {
-            stored_ = std::move(next);
-            loaded_ = id;
-            loadedOnce_ = true;
-            return true;
-        }
-        next.erase(it);
-    }
-    auto xml = toXmlPlist(Value(next));
-    if (!xml) {
+    // Refused on its own, before it can spoil the batch it would join.
+    if (value && !toXmlPlist(*value)) {
         qaxLog().error("Cannot store a value under '%@': it has no property-list form", key);
         return false;
     }
-    std::string error;
-    if (!writeFileAtomically(path_, *xml, &error, 0600)) {
-        qaxLog().error("Cannot write preference domain file '%@': %@", path_, error);
-        return false;
+    // Changes made while the file is being written go out together in the next write: each
+    // write costs two flushes to disk, and downloads finishing together change keys together.
+    std::unique_lock lock(mutex_);
+    Change change{key, value};
+    pending_.push_back(&change);
+    while (!change.done) {
+        if (writing_) {
+            written_.wait(lock);
+            continue;
+        }
+        writing_ = true;
+        std::vector<Change*> batch;
+        batch.swap(pending_);
+        lock.unlock();
+        const bool ok = writeBatch(batch);
+        lock.lock();
+        for (Change* c : batch) {
+            c->ok = ok;
+            c->done = true;
+        }
+        writing_ = false;
+        written_.notify_all();
     }
+    return change.ok;
+}
+
+bool FilePreferenceStore::writeBatch(const std::vector<Change*>& batch) {
+    Value::Dictionary next;
+    FileIdentity written;
+    {
+        FileLock fileLock(path_ + ".lock", LOCK_EX);
+        // Start from the file as it is now, not from what this process read earlier, so that
+        // another writer's keys survive.
+        written = currentIdentity();
+        next = loadLocked(written);
+        bool changed = false;
+        for (const Change* c : batch) {
+            if (c->value) {
+                next.insert_or_assign(std::string(c->key), *c->value);
+                changed = true;
+            } else if (auto it = next.find(c->key); it != next.end()) {
+                next.erase(it);
+                changed = true;
+            }
+        }
+        if (changed) {
+            // Every value was checked alone, so the whole has a property-list form.
+            const auto xml = toXmlPlist(Value(next));
+            std::string error;
+            if (!xml || !writeFileAtomically(path_, *xml, &error, 0600)) {
+                qaxLog().error("Cannot write preference domain file '%@': %@", path_, error);
+                return false;
+            }
+            written = currentIdentity();
+        }
+    }
+    // Only once the file lock is let go: a reader holding mutex_ may be waiting for it.
+    std::lock_guard lock(mutex_);
     stored_ = std::move(next);
-    loaded_ = currentIdentity();
+    loaded_ = written;
     loadedOnce_ = true;
     return true;
 }

@@ -1,9 +1,12 @@
 #include "platform/host/HostClientConnection.h"
 
+#include <asio/dispatch.hpp>
 #include <asio/post.hpp>
 #include <asio/write.hpp>
 #include <chrono>
+#include <vector>
 
+#include "core/FileSnapshotScope.h"
 #include "core/Log.h"
 #include "core/OnceCallback.h"
 #include "core/PlistCodec.h"
@@ -15,9 +18,9 @@ namespace {
 constexpr auto kIncompleteRequestTimeout = std::chrono::seconds(60);
 // Beyond this many unanswered requests the connection stops reading until replies go out.
 constexpr int kMaxRequestsInFlight = 64;
-// Requests are small; a large frame accumulates in the decoder over several reads. A small
-// chunk keeps a thousand idle connections cheap.
-constexpr std::size_t kReadChunkBytes = 8 * 1024;
+// Bytes are read into a buffer of the reading thread, shared by all its connections; a large
+// frame accumulates in the connection's decoder over several reads.
+constexpr std::size_t kReadChunkBytes = 64 * 1024;
 
 constexpr const char* kIdKey = "id";
 constexpr const char* kOpKey = "op";
@@ -27,13 +30,14 @@ constexpr const char* kErrorKey = "error";
 
 }  // namespace
 
-HostClientConnection::HostClientConnection(Socket socket, std::shared_ptr<TaskRunner> requestQueue,
-                                           std::shared_ptr<void> transaction)
+HostClientConnection::HostClientConnection(Socket socket, std::shared_ptr<void> transaction)
     : socket_(std::move(socket)),
       idleTimer_(socket_.get_executor()),
-      requestQueue_(std::move(requestQueue)),
       transaction_(std::move(transaction)) {
-    readBuffer_.resize(kReadChunkBytes);
+    // Replies are written at once when the socket takes them; a full socket says so rather
+    // than blocking the strand.
+    asio::error_code ignored;
+    socket_.non_blocking(true, ignored);
 }
 
 HostClientConnection::~HostClientConnection() = default;
@@ -91,17 +95,39 @@ void HostClientConnection::readMore() {
         armIdleTimer();
     } else {
         idleTimer_.cancel();
+        decoder_.release();
     }
-    socket_.async_read_some(asio::buffer(readBuffer_),
-                            [self = shared_from_this()](const asio::error_code& ec, std::size_t n) {
-                                self->reading_ = false;
-                                if (ec) {
-                                    // End of stream or a reset: the client went away.
-                                    self->closeNow();
-                                    return;
-                                }
-                                self->handleBytes(n);
-                            });
+    // Waiting for readability rather than reading into a buffer of our own: an idle
+    // connection then holds no buffer.
+    socket_.async_wait(Socket::wait_read, [self = shared_from_this()](const asio::error_code& ec) {
+        self->reading_ = false;
+        if (ec) {
+            // Closed here, or cancelled: nothing more to read.
+            self->closeNow();
+            return;
+        }
+        // The request's log lines go out together, after its reply, and it sees each file it
+        // reads as it was at its first look.
+        LogBatch batch;
+        FileSnapshotScope snapshot;
+        self->readAvailable();
+    });
+}
+
+void HostClientConnection::readAvailable() {
+    thread_local std::vector<char> buffer(kReadChunkBytes);
+    asio::error_code ec;
+    const std::size_t n = socket_.read_some(asio::buffer(buffer), ec);
+    if (ec == asio::error::would_block || ec == asio::error::try_again) {
+        readMore();
+        return;
+    }
+    if (ec) {
+        // End of stream or a reset: the client went away.
+        closeNow();
+        return;
+    }
+    handleBytes(std::string_view(buffer.data(), n));
 }
 
 void HostClientConnection::armIdleTimer() {
@@ -115,30 +141,34 @@ void HostClientConnection::armIdleTimer() {
     });
 }
 
-void HostClientConnection::handleBytes(std::size_t n) {
+void HostClientConnection::handleBytes(std::string_view bytes) {
     if (closed_) {
         return;
     }
-    decoder_.append(std::string_view(readBuffer_.data(), n));
-    std::string payload;
+    decoder_.append(bytes);
+    handling_ = true;
     for (;;) {
+        std::string_view payload;
         std::string error;
         auto status = decoder_.next(payload, &error);
         if (status == IpcFrameCodec::Status::NeedMore) {
             break;
         }
         if (status == IpcFrameCodec::Status::Error) {
+            handling_ = false;
             closeWithError(error);
             return;
         }
         if (!handleFrame(payload)) {
+            handling_ = false;
             return;
         }
     }
+    handling_ = false;
     readMore();
 }
 
-bool HostClientConnection::handleFrame(const std::string& payload) {
+bool HostClientConnection::handleFrame(std::string_view payload) {
     std::string error;
     auto message = parsePlist(payload, &error);
     if (!message) {
@@ -156,11 +186,11 @@ bool HostClientConnection::handleFrame(const std::string& payload) {
     const Value* args = message->find(kArgsKey);
     if (!op || !op->isString()) {
         sendReply(requestId, RemoteReply::failure("malformed request: op is not a string"));
-        return true;
+        return !closed_;
     }
     if (args && !args->isArray()) {
         sendReply(requestId, RemoteReply::failure("malformed request: args is not an array"));
-        return true;
+        return !closed_;
     }
     std::shared_ptr<const RemoteInterface> interface;
     std::shared_ptr<ExportedObject> object;
@@ -171,19 +201,19 @@ bool HostClientConnection::handleFrame(const std::string& payload) {
     }
     if (!interface || !object) {
         sendReply(requestId, RemoteReply::failure("no interface is exported"));
-        return true;
+        return !closed_;
     }
     // A request keeps its connection alive until it has replied: while reading is paused no
     // socket operation may be pending, and the connection must not go with them.
     std::function<void(RemoteReply)> reply = [self = shared_from_this(), requestId](RemoteReply r) {
         self->sendReply(requestId, std::move(r));
     };
-    requestQueue_->post([interface, object, name = *op->asString(),
-                         list = args ? *args->asArray() : Value::Array{},
-                         reply = onceCallback(std::move(reply), "IPC reply")]() mutable {
-        interface->invoke(object, name, list, std::move(reply));
-    });
-    return true;
+    // This strand is the connection's request queue: the request runs here and now, and an
+    // answer given at once is written before the next frame is looked at.
+    static const Value::Array kNoArguments;
+    interface->invoke(object, *op->asString(), args ? *args->asArray() : kNoArguments,
+                      onceCallback(std::move(reply), "IPC reply"));
+    return !closed_;
 }
 
 void HostClientConnection::sendReply(std::int64_t id, RemoteReply reply) {
@@ -199,22 +229,39 @@ void HostClientConnection::sendReply(std::int64_t id, RemoteReply reply) {
         message[kErrorKey] = "reply cannot be encoded";
         frame = IpcFrameCodec::encode(Value(std::move(message)));
     }
-    asio::post(socket_.get_executor(),
-               [self = shared_from_this(), frame = std::move(frame)]() mutable {
-                   --self->inFlight_;
-                   if (self->closed_ || !frame) {
-                       return;
-                   }
-                   self->enqueueWrite(std::move(*frame));
-                   self->readMore();
-               });
+    // On the strand already (a request answered at once) this runs now; from another thread
+    // it is queued there.
+    asio::dispatch(socket_.get_executor(),
+                   [self = shared_from_this(), frame = std::move(frame)]() mutable {
+                       --self->inFlight_;
+                       if (self->closed_ || !frame) {
+                           return;
+                       }
+                       self->enqueueWrite(std::move(*frame));
+                       if (!self->handling_) {
+                           self->readMore();
+                       }
+                   });
 }
 
 void HostClientConnection::enqueueWrite(std::string frame) {
-    writeQueue_.push_back(std::move(frame));
-    if (!writing_) {
-        writeNext();
+    if (writing_ || !writeQueue_.empty()) {
+        writeQueue_.push_back(std::move(frame));
+        return;
     }
+    // Usually the whole reply fits in the socket: one write, and no completion to wait for.
+    asio::error_code ec;
+    const std::size_t written = socket_.write_some(asio::buffer(frame), ec);
+    if (ec && ec != asio::error::would_block && ec != asio::error::try_again) {
+        closeNow();
+        return;
+    }
+    if (written == frame.size()) {
+        return;
+    }
+    frame.erase(0, written);
+    writeQueue_.push_back(std::move(frame));
+    writeNext();
 }
 
 void HostClientConnection::writeNext() {

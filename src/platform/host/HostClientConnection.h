@@ -1,10 +1,13 @@
 // One client of the agent's Unix socket. The socket is bound to the connection's own strand,
-// which is also its request queue: reads, requests (one at a time, in arrival order, where the
-// exported interface calls the exported object) and writes run there, so a request answered
-// at once never changes threads. Replies may come from any thread and in any order; they are
-// encoded on the replying thread and written from the strand. The peer facts and the exported
-// interface and object are set by the listener before resume() and guarded by a mutex. The
-// connection keeps the process alive (its lifecycle transaction) until it is closed.
+// which is also its request queue, on one of the dispatcher's I/O threads: reads, requests
+// (one at a time, in arrival order, where the exported interface calls the exported object)
+// and writes run there. A request answered at once is read, served and answered by the thread
+// that saw the socket become readable, and its reply goes out in one write. Replies may come
+// from any thread and in any order; they are encoded on the replying thread and written from
+// the strand. The peer facts and the exported interface and object are set by the listener
+// before resume() and guarded by a mutex. The connection keeps the process alive (its
+// lifecycle transaction) until it is closed. An idle connection holds no read buffer: bytes
+// are read into a buffer of the I/O thread, and only an incomplete frame is kept.
 #pragma once
 
 #include <sys/types.h>
@@ -16,8 +19,8 @@
 #include <memory>
 #include <mutex>
 #include <string>
+#include <string_view>
 
-#include "core/TaskRunner.h"
 #include "platform/ServiceListener.h"
 #include "platform/host/IpcFrameCodec.h"
 
@@ -28,10 +31,9 @@ class HostClientConnection : public ClientConnection,
   public:
     using Socket = asio::local::stream_protocol::socket;
 
-    // `requestQueue` runs on the socket's strand. `transaction` is let go when the connection
-    // closes.
-    HostClientConnection(Socket socket, std::shared_ptr<TaskRunner> requestQueue,
-                         std::shared_ptr<void> transaction = nullptr);
+    // `socket` is bound to the connection's strand. `transaction` is let go when the
+    // connection closes.
+    explicit HostClientConnection(Socket socket, std::shared_ptr<void> transaction = nullptr);
     ~HostClientConnection() override;
 
     pid_t peerProcessIdentifier() const override;
@@ -49,19 +51,21 @@ class HostClientConnection : public ClientConnection,
     void closeNow();
 
   private:
+    // Waits for the socket to become readable (unless paused, waiting already or closed).
     void readMore();
-    void handleBytes(std::size_t n);
+    void readAvailable();
+    void handleBytes(std::string_view bytes);
     // False when the connection had to be closed.
-    bool handleFrame(const std::string& payload);
+    bool handleFrame(std::string_view payload);
     void armIdleTimer();
     void sendReply(std::int64_t id, RemoteReply reply);
+    // On the strand: writes what it can at once, queues the rest.
     void enqueueWrite(std::string frame);
     void writeNext();
     void closeWithError(const std::string& reason);
 
     Socket socket_;
     asio::steady_timer idleTimer_;
-    std::shared_ptr<TaskRunner> requestQueue_;
 
     mutable std::mutex mutex_;
     pid_t pid_ = 0;
@@ -72,9 +76,10 @@ class HostClientConnection : public ClientConnection,
     // On the strand only.
     std::shared_ptr<void> transaction_;
     IpcFrameCodec decoder_;
-    std::string readBuffer_;
     std::deque<std::string> writeQueue_;
     bool reading_ = false;
+    // Inside handleBytes(): a reply given there does not resume reading, the loop does.
+    bool handling_ = false;
     bool writing_ = false;
     bool closed_ = false;
     bool resumed_ = false;

@@ -126,6 +126,11 @@ std::shared_ptr<Platform> makeHostPlatform(const HostEnvironment& environment,
 
     auto httpOptions = CurlHttpClient::optionsForPlatformRoot(p->platformRoot);
     httpOptions.lifecycle = p->lifecycle;
+    // What completions do (writing preferences and caches) must not hold up the transfers.
+    // Tools have no dispatcher: their completions run on the session's thread.
+    if (p->dispatcher) {
+        httpOptions.completionQueue = p->dispatcher->backgroundQueue();
+    }
     p->http = std::make_shared<CurlHttpClient>(std::move(httpOptions));
     // Further host bindings are installed here, one line each.
     p->pairedDevices = std::make_shared<HostPairedDeviceRegistry>(p->platformRoot);

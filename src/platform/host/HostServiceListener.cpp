@@ -153,8 +153,8 @@ void HostServiceListener::acceptNext() {
             return;
         }
         if (!ec) {
-            // The connection's socket and its request queue share one strand of the pool,
-            // so a request is read, served and answered without changing threads.
+            // The connection's socket and its request queue share one strand on an I/O
+            // thread, so a request is read, served and answered without changing threads.
             auto strand = self->dispatcher_->makeIoStrand();
             asio::local::stream_protocol::socket onStrand(strand.executor);
             asio::error_code moveError;
@@ -166,7 +166,7 @@ void HostServiceListener::acceptNext() {
                 return;
             }
             auto connection = std::make_shared<HostClientConnection>(
-                std::move(onStrand), strand.queue,
+                std::move(onStrand),
                 self->lifecycle_ ? self->lifecycle_->beginTransaction(kConnectionTransaction)
                                  : nullptr);
             const auto id = self->nextConnection_++;

@@ -1,10 +1,9 @@
 #include "platform/host/HostStoreEndpoint.h"
 
-#include <curl/curl.h>
-
 #include <filesystem>
 
 #include "core/JsonCodec.h"
+#include "platform/host/CurlLibrary.h"
 
 namespace qax {
 namespace {
@@ -16,32 +15,36 @@ constexpr double kStoreRequestTimeoutSeconds = 30;
 // not an absolute http(s) URL.
 std::optional<std::string> urlWithQuery(
     const std::string& base, const std::vector<std::pair<std::string, std::string>>& query) {
-    std::unique_ptr<CURLU, decltype(&curl_url_cleanup)> url(curl_url(), curl_url_cleanup);
-    if (!url || curl_url_set(url.get(), CURLUPART_URL, base.c_str(), 0) != CURLUE_OK) {
+    const CurlLibrary* curl = CurlLibrary::get();
+    if (!curl) {
+        return std::nullopt;
+    }
+    std::unique_ptr<CURLU, decltype(curl->url_cleanup)> url(curl->url(), curl->url_cleanup);
+    if (!url || curl->url_set(url.get(), CURLUPART_URL, base.c_str(), 0) != CURLUE_OK) {
         return std::nullopt;
     }
     char* scheme = nullptr;
-    if (curl_url_get(url.get(), CURLUPART_SCHEME, &scheme, 0) != CURLUE_OK) {
+    if (curl->url_get(url.get(), CURLUPART_SCHEME, &scheme, 0) != CURLUE_OK) {
         return std::nullopt;
     }
     const std::string schemeText = scheme;
-    curl_free(scheme);
+    curl->free(scheme);
     if (schemeText != "https" && schemeText != "http") {
         return std::nullopt;
     }
     for (const auto& [name, value] : query) {
         const std::string pair = name + "=" + value;
-        if (curl_url_set(url.get(), CURLUPART_QUERY, pair.c_str(),
-                         CURLU_APPENDQUERY | CURLU_URLENCODE) != CURLUE_OK) {
+        if (curl->url_set(url.get(), CURLUPART_QUERY, pair.c_str(),
+                          CURLU_APPENDQUERY | CURLU_URLENCODE) != CURLUE_OK) {
             return std::nullopt;
         }
     }
     char* full = nullptr;
-    if (curl_url_get(url.get(), CURLUPART_URL, &full, 0) != CURLUE_OK) {
+    if (curl->url_get(url.get(), CURLUPART_URL, &full, 0) != CURLUE_OK) {
         return std::nullopt;
     }
     std::string out = full;
-    curl_free(full);
+    curl->free(full);
     return out;
 }
 

@@ -24,9 +24,15 @@ class IpcFrameCodec {
     // The next whole frame's payload into `payload`. Error (with a reason) when the length
     // header is out of range; the stream cannot be resynchronised after that.
     Status next(std::string& payload, std::string* error = nullptr);
+    // The same without a copy: `payload` points into the decoder and stays valid until the
+    // next call of append() or release().
+    Status next(std::string_view& payload, std::string* error = nullptr);
     // Whether bytes of a frame not yet complete are held.
     bool hasPartialFrame() const { return buffered() > 0; }
     std::size_t buffered() const { return buffer_.size() - consumed_; }
+    // Gives back the memory of a large frame once nothing is held, so that a connection that
+    // once sent a big request does not keep its buffer.
+    void release();
 
     // Header and payload of one frame; none when the payload is empty or over the limit.
     static std::optional<std::string> frame(std::string_view payload);
