@@ -223,7 +223,9 @@ class ServiceFaultTest : public ::testing::Test {
         if (step != "tls") {
             setScenario(R"({"*": [)" + [&] {
                 std::string list;
-                for (int i = 0; i < 4 * kClients; ++i) {
+                // Plenty: the HTTP session tries a request again on a fresh connection when a
+                // reused one was reset before any answer.
+                for (int i = 0; i < 10 * kClients; ++i) {
                     list += (i ? ", \"" : "\"") + step + "\"";
                 }
                 return list;
