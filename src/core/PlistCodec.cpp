@@ -200,6 +200,30 @@ bool binaryStructureIsSafe(std::string_view s, std::string* error) {
     return true;
 }
 
+// The dates a property list can hold, in seconds from 2001: the library's are 32-bit, and
+// the lowest is also what it reads a date beyond them as.
+constexpr int32_t kEarliestDate = std::numeric_limits<int32_t>::min() + 1;
+constexpr int32_t kLatestDate = std::numeric_limits<int32_t>::max();
+
+// The seconds from 2001 a date node holds, as stored (the earliest date when they cannot be
+// had): the library's accessor cuts them to 32 bits, its binary form keeps the double.
+double storedDate(plist_t node) {
+    char* bytes = nullptr;
+    uint32_t length = 0;
+    plist_to_bin(node, &bytes, &length);
+    double seconds = std::numeric_limits<double>::quiet_NaN();
+    // "bplist00", then the one object: 0x33 and a big-endian double.
+    if (bytes && length >= 17 && static_cast<unsigned char>(bytes[8]) == 0x33) {
+        uint64_t bits = 0;
+        for (int i = 9; i < 17; ++i) {
+            bits = bits << 8 | static_cast<unsigned char>(bytes[i]);
+        }
+        std::memcpy(&seconds, &bits, sizeof seconds);
+    }
+    std::free(bytes);
+    return std::isnan(seconds) ? kEarliestDate : seconds;
+}
+
 // Text as a property list can store it again. libplist hands over a damaged file's bytes as
 // they are, but writes non-ASCII strings of a binary file through UTF-16 and stops at the
 // first byte that is not UTF-8, so keys and texts would be cut short on the next save. Such
@@ -254,9 +278,19 @@ std::optional<Value> fromPlist(plist_t node) {
             return Value(p ? textFromPlist(p, len) : std::string());
         }
         case PLIST_DATE: {
+            // The library hands out the seconds rounded toward zero and the size of the
+            // fraction without its sign: a date before 2001 has its fraction taken away.
             int32_t sec = 0, usec = 0;
             plist_get_date_val(node, &sec, &usec);
-            return Value(Date(kSecondsFrom1970To2001 + sec + usec / 1e6));
+            const double fraction = std::abs(usec) / 1e6;
+            double rel = sec + (sec < 0 ? -fraction : fraction);
+            if (sec == std::numeric_limits<int32_t>::min()) {
+                // Also what the seconds read as when the stored date is beyond them either
+                // way (a damaged file): such a date is read as the nearest one that can be
+                // written again, so a read file still saves.
+                rel = std::clamp(storedDate(node), double(kEarliestDate), double(kLatestDate));
+            }
+            return Value(Date(kSecondsFrom1970To2001 + rel));
         }
         case PLIST_DATA: {
             uint64_t len = 0;
@@ -320,9 +354,14 @@ plist_t toPlist(const Value& v) {
             return plist_new_string(v.asString()->c_str());
         case Value::Kind::Date: {
             double rel = v.asDate()->secondsSince1970() - kSecondsFrom1970To2001;
+            // Within the second before 2001 the fraction's sign cannot be read back (the
+            // seconds read as 0): such a date is kept as the whole second before.
+            if (rel > -1 && rel < 0) {
+                rel = -1;
+            }
             double sec = std::floor(rel);
-            if (!std::isfinite(sec) || sec < std::numeric_limits<int32_t>::min() ||
-                sec > std::numeric_limits<int32_t>::max()) {
+            if (!std::isfinite(sec) || rel <= std::numeric_limits<int32_t>::min() ||
+                sec > kLatestDate) {
                 return nullptr;
             }
             auto usec = static_cast<int32_t>(std::llround((rel - sec) * 1e6));
