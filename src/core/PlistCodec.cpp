@@ -282,15 +282,16 @@ std::optional<Value> fromPlist(plist_t node) {
             // fraction without its sign: a date before 2001 has its fraction taken away.
             int32_t sec = 0, usec = 0;
             plist_get_date_val(node, &sec, &usec);
-            const double fraction = std::abs(usec) / 1e6;
-            double rel = sec + (sec < 0 ? -fraction : fraction);
             if (sec == std::numeric_limits<int32_t>::min()) {
                 // Also what the seconds read as when the stored date is beyond them either
                 // way (a damaged file): such a date is read as the nearest one that can be
                 // written again, so a read file still saves.
-                rel = std::clamp(storedDate(node), double(kEarliestDate), double(kLatestDate));
+                return Value(
+                    Date(kSecondsFrom1970To2001 +
+                         std::clamp(storedDate(node), double(kEarliestDate), double(kLatestDate))));
             }
-            return Value(Date(kSecondsFrom1970To2001 + rel));
+            const double fraction = std::abs(usec) / 1e6;
+            return Value(Date(kSecondsFrom1970To2001 + sec + (sec < 0 ? -fraction : fraction)));
         }
         case PLIST_DATA: {
             uint64_t len = 0;
