@@ -245,10 +245,12 @@ class ServiceFaultTest : public ::testing::Test {
         return steady(agent.pid());
     }
 
-    // The first failures of each kind grow the agent once (TLS state for a second host, the
-    // allocator's per-thread arenas: 2 to 7 MiB here); one answer of a huge body kept in memory
-    // would take 10 MiB more.
-    static constexpr long kFirstRoundGrowthKiB = 8 * 1024;
+    // The failures grow the agent while the allocator settles (TLS state for a second host,
+    // per-thread arenas): 2 to 8 MiB in all, and up to 4.4 MiB in one fault when a loaded
+    // machine had more transfers at once. One answer of a huge body kept in memory would take
+    // 10 MiB in that fault alone.
+    static constexpr long kFirstRoundGrowthKiB = 12 * 1024;
+    static constexpr long kOneFaultGrowthKiB = 6 * 1024;
 
     test::AgentProcess agent;
     FilePreferenceStore preferences{FilePreferenceStore::domainPath(agent.home())};
@@ -263,12 +265,12 @@ TEST_F(ServiceFaultTest, EveryClientIsAnsweredTheCacheKeptAndMemoryReturns) {
     test::CoverageSimProcess stranger(agent.home() + "/stranger", agent.home() + "/stranger-root");
     ASSERT_FALSE(stranger.base().empty());
     // A second round of every fault must not grow the agent by more than the allocator settling
-    // (up to 1.7 MiB seen after the second TLS failures, none after a third).
-    constexpr long kSecondRoundGrowthKiB = 2048;
+    // (1.7 MiB on a quiet machine, 4.4 MiB on a loaded one, both from the TLS failures).
+    constexpr long kSecondRoundGrowthKiB = 6 * 1024;
 
     const char* faults[] = {"garbage", "html",  "huge 10485760", "deep 100000",
                             "array",   "reset", "reset 4096",    "tls"};
-    Usage afterFirstRound;
+    Usage afterFirstRound, before = idle;
     for (int round = 1; round <= 2; ++round) {
         for (const char* fault : faults) {
             SCOPED_TRACE(std::string(fault) + ", round " + std::to_string(round));
@@ -283,6 +285,8 @@ TEST_F(ServiceFaultTest, EveryClientIsAnsweredTheCacheKeptAndMemoryReturns) {
             EXPECT_EQ(after.files, idle.files);
             EXPECT_LE(after.connections, 2 * kClients) << "connections kept for reuse";
             EXPECT_LE(after.rssKiB, idle.rssKiB + kFirstRoundGrowthKiB);
+            EXPECT_LE(after.rssKiB, before.rssKiB + kOneFaultGrowthKiB);
+            before = after;
             std::printf(
                 "round %d, %-14s resident %ld KiB (idle %ld KiB, peak so far %ld KiB), "
                 "open files %d (idle %d) and %d connections\n",
