@@ -228,7 +228,7 @@ double storedDate(plist_t node) {
 // they are, but writes non-ASCII strings of a binary file through UTF-16 and stops at the
 // first byte that is not UTF-8, so keys and texts would be cut short on the next save. Such
 // bytes become U+FFFD as they are read: what is read is what is written back.
-std::string textFromPlist(const char* p, std::size_t n) {
+std::string utf8FromPlist(const char* p, std::size_t n) {
     const auto* bytes = reinterpret_cast<const unsigned char*>(p);
     if (std::all_of(bytes, bytes + n, [](unsigned char c) { return c < 0x80; })) {
         return std::string(p, n);
@@ -246,6 +246,15 @@ std::string textFromPlist(const char* p, std::size_t n) {
     u_strToUTF8(text.data(), static_cast<int32_t>(text.size()), &length, wide.data(), units,
                 &status);
     text.resize(U_SUCCESS(status) ? static_cast<std::size_t>(length) : 0);
+    return text;
+}
+
+// A NUL character would end the text where the library writes it: it becomes U+FFFD too.
+std::string textFromPlist(const char* p, std::size_t n) {
+    std::string text = utf8FromPlist(p, n);
+    for (std::size_t at = text.find('\0'); at != std::string::npos; at = text.find('\0', at)) {
+        text.replace(at, 1, "\xEF\xBF\xBD");
+    }
     return text;
 }
 
