@@ -2,6 +2,8 @@
 // start-up sequence and then the main event loop until SIGTERM or SIGINT, or, when the service
 // manager started it on demand, until it has been idle (see HostProcessLifecycle). The main
 // thread runs start-up, then the loop (socket I/O of the IPC service, signals, main-queue work).
+#include <malloc.h>
+
 #include <csignal>
 
 #include <asio/io_context.hpp>
@@ -39,6 +41,10 @@ int main() {
 
     // A peer that hangs up mid-reply must not end the process.
     std::signal(SIGPIPE, SIG_IGN);
+    // Large blocks (an oversized answer of a service, a big reply) go back to the system when
+    // freed. Left to itself glibc raises this threshold after freeing the first one and then
+    // keeps tens of megabytes in its heaps for good.
+    mallopt(M_MMAP_THRESHOLD, 256 * 1024);
 
     auto dispatcher = std::make_shared<AsioDispatcher>();
     asio::signal_set stopSignals(dispatcher->mainContext(), SIGTERM, SIGINT);

@@ -1,7 +1,9 @@
 #include "core/PlistCodec.h"
 
 #include <plist/plist.h>
+#include <unicode/ustring.h>
 
+#include <algorithm>
 #include <cmath>
 #include <cstdlib>
 #include <cstring>
@@ -105,6 +107,44 @@ bool binaryStructureIsSafe(std::string_view s, std::string* error) {
         out = readBigEndian(data + tableOffset + index * offsetSize, offsetSize);
         return out >= 8 && out < tableOffset;
     };
+    // The element count of the object at `off` (from its marker, or the integer after it) and
+    // where its content starts.
+    auto objectLength = [&](std::uint64_t off, std::uint64_t& count, std::uint64_t& pos) {
+        count = data[off] & 0xF;
+        pos = off + 1;
+        if (count != 0xF) {
+            return true;
+        }
+        if (pos >= tableOffset || (data[pos] >> 4) != 0x1) {
+            return false;
+        }
+        const std::size_t n = std::size_t{1} << (data[pos] & 0xF);
+        if (n > 8 || pos + 1 + n > tableOffset) {
+            return false;
+        }
+        count = readBigEndian(data + pos + 1, n);
+        pos += 1 + n;
+        return true;
+    };
+    // An ASCII or UTF-16 string inside the object area, without a NUL character.
+    auto isPlainKey = [&](std::uint64_t index) {
+        std::uint64_t off = 0, count = 0, pos = 0;
+        if (!objectOffset(index, off) || !objectLength(off, count, pos)) {
+            return false;
+        }
+        const unsigned type = data[off] >> 4;
+        const std::uint64_t unit = type == 0x5 ? 1 : type == 0x6 ? 2 : 0;
+        if (unit == 0 || count > (tableOffset - pos) / unit) {
+            return false;
+        }
+        for (std::uint64_t i = 0; i < count; ++i) {
+            const unsigned char* c = data + pos + i * unit;
+            if (c[0] == 0 && (unit == 1 || c[1] == 0)) {
+                return false;
+            }
+        }
+        return true;
+    };
     constexpr std::size_t kMaxVisits = 1'000'000;
     std::size_t visits = 0;
     struct Item {
@@ -129,25 +169,14 @@ bool binaryStructureIsSafe(std::string_view s, std::string* error) {
             setError(error, "binary property list object offset out of range");
             return false;
         }
-        const unsigned marker = data[off];
-        const unsigned type = marker >> 4;
+        const unsigned type = data[off] >> 4;
         if (type != 0xA && type != 0xC && type != 0xD) {
             continue;  // not a container
         }
-        std::uint64_t count = marker & 0xF;
-        std::uint64_t pos = off + 1;
-        if (count == 0xF) {
-            if (pos >= tableOffset || (data[pos] >> 4) != 0x1) {
-                setError(error, "malformed container length");
-                return false;
-            }
-            const std::size_t n = std::size_t{1} << (data[pos] & 0xF);
-            if (n > 8 || pos + 1 + n > tableOffset) {
-                setError(error, "malformed container length");
-                return false;
-            }
-            count = readBigEndian(data + pos + 1, n);
-            pos += 1 + n;
+        std::uint64_t count = 0, pos = 0;
+        if (!objectLength(off, count, pos)) {
+            setError(error, "malformed container length");
+            return false;
         }
         const std::uint64_t refs = type == 0xD ? count * 2 : count;
         if (count > tableOffset || refs > (tableOffset - pos) / refSize) {
@@ -160,10 +189,73 @@ bool binaryStructureIsSafe(std::string_view s, std::string* error) {
                 setError(error, "object reference out of range");
                 return false;
             }
+            // libplist aborts the process on a dictionary key holding a NUL character.
+            if (type == 0xD && k < count && !isPlainKey(ref)) {
+                setError(error, "dictionary key is not a string without NUL characters");
+                return false;
+            }
             stack.push_back({ref, item.depth + 1});
         }
     }
     return true;
+}
+
+// The dates a property list can hold, in seconds from 2001: the library's are 32-bit, and
+// the lowest is also what it reads a date beyond them as.
+constexpr int32_t kEarliestDate = std::numeric_limits<int32_t>::min() + 1;
+constexpr int32_t kLatestDate = std::numeric_limits<int32_t>::max();
+
+// The seconds from 2001 a date node holds, as stored (the earliest date when they cannot be
+// had): the library's accessor cuts them to 32 bits, its binary form keeps the double.
+double storedDate(plist_t node) {
+    char* bytes = nullptr;
+    uint32_t length = 0;
+    plist_to_bin(node, &bytes, &length);
+    double seconds = std::numeric_limits<double>::quiet_NaN();
+    // "bplist00", then the one object: 0x33 and a big-endian double.
+    if (bytes && length >= 17 && static_cast<unsigned char>(bytes[8]) == 0x33) {
+        uint64_t bits = 0;
+        for (int i = 9; i < 17; ++i) {
+            bits = bits << 8 | static_cast<unsigned char>(bytes[i]);
+        }
+        std::memcpy(&seconds, &bits, sizeof seconds);
+    }
+    std::free(bytes);
+    return std::isnan(seconds) ? kEarliestDate : seconds;
+}
+
+// Text as a property list can store it again. libplist hands over a damaged file's bytes as
+// they are, but writes non-ASCII strings of a binary file through UTF-16 and stops at the
+// first byte that is not UTF-8, so keys and texts would be cut short on the next save. Such
+// bytes become U+FFFD as they are read: what is read is what is written back.
+std::string utf8FromPlist(const char* p, std::size_t n) {
+    const auto* bytes = reinterpret_cast<const unsigned char*>(p);
+    if (std::all_of(bytes, bytes + n, [](unsigned char c) { return c < 0x80; })) {
+        return std::string(p, n);
+    }
+    UErrorCode status = U_ZERO_ERROR;
+    int32_t units = 0, substitutions = 0;
+    std::u16string wide(n, u'\0');
+    u_strFromUTF8WithSub(wide.data(), static_cast<int32_t>(wide.size()), &units, p,
+                         static_cast<int32_t>(n), 0xFFFD, &substitutions, &status);
+    if (U_FAILURE(status) || substitutions == 0) {
+        return std::string(p, n);
+    }
+    std::string text(static_cast<std::size_t>(units) * 3, '\0');
+    int32_t length = 0;
+    u_strToUTF8(text.data(), static_cast<int32_t>(text.size()), &length, wide.data(), units,
+                &status);
+    text.resize(U_SUCCESS(status) ? static_cast<std::size_t>(length) : 0);
+    return text;
+}
+
+// A NUL character would end the text where the library writes it: it becomes U+FFFD too.
+std::string textFromPlist(const char* p, std::size_t n) {
+    std::string text = utf8FromPlist(p, n);
+    for (std::size_t at = text.find('\0'); at != std::string::npos; at = text.find('\0', at)) {
+        text.replace(at, 1, "\xEF\xBF\xBD");
+    }
+    return text;
 }
 
 std::optional<Value> fromPlist(plist_t node) {
@@ -192,12 +284,23 @@ std::optional<Value> fromPlist(plist_t node) {
         case PLIST_KEY: {
             uint64_t len = 0;
             const char* p = plist_get_string_ptr(node, &len);
-            return Value(std::string(p ? p : "", p ? len : 0));
+            return Value(p ? textFromPlist(p, len) : std::string());
         }
         case PLIST_DATE: {
+            // The library hands out the seconds rounded toward zero and the size of the
+            // fraction without its sign: a date before 2001 has its fraction taken away.
             int32_t sec = 0, usec = 0;
             plist_get_date_val(node, &sec, &usec);
-            return Value(Date(kSecondsFrom1970To2001 + sec + usec / 1e6));
+            if (sec == std::numeric_limits<int32_t>::min()) {
+                // Also what the seconds read as when the stored date is beyond them either
+                // way (a damaged file): such a date is read as the nearest one that can be
+                // written again, so a read file still saves.
+                return Value(
+                    Date(kSecondsFrom1970To2001 +
+                         std::clamp(storedDate(node), double(kEarliestDate), double(kLatestDate))));
+            }
+            const double fraction = std::abs(usec) / 1e6;
+            return Value(Date(kSecondsFrom1970To2001 + sec + (sec < 0 ? -fraction : fraction)));
         }
         case PLIST_DATA: {
             uint64_t len = 0;
@@ -231,7 +334,7 @@ std::optional<Value> fromPlist(plist_t node) {
                     break;
                 }
                 auto v = fromPlist(item);
-                std::string k = key ? key : "";
+                std::string k = key ? textFromPlist(key, std::strlen(key)) : std::string();
                 std::free(key);
                 if (!v) {
                     std::free(it);
@@ -261,9 +364,14 @@ plist_t toPlist(const Value& v) {
             return plist_new_string(v.asString()->c_str());
         case Value::Kind::Date: {
             double rel = v.asDate()->secondsSince1970() - kSecondsFrom1970To2001;
+            // Within the second before 2001 the fraction's sign cannot be read back (the
+            // seconds read as 0): such a date is kept as the whole second before.
+            if (rel > -1 && rel < 0) {
+                rel = -1;
+            }
             double sec = std::floor(rel);
-            if (!std::isfinite(sec) || sec < std::numeric_limits<int32_t>::min() ||
-                sec > std::numeric_limits<int32_t>::max()) {
+            if (!std::isfinite(sec) || rel <= std::numeric_limits<int32_t>::min() ||
+                sec > kLatestDate) {
                 return nullptr;
             }
             auto usec = static_cast<int32_t>(std::llround((rel - sec) * 1e6));

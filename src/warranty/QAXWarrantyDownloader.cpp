@@ -30,6 +30,10 @@ constexpr double kRequestTimeoutSeconds = 30;
 constexpr const char* kCacheVersion = "2";
 constexpr long kStatusOK = 200;
 constexpr long kStatusUnauthorized = 401;
+// A summary is a few kilobytes. A far larger answer would become a cache entry too large to
+// be sent to any client (an IPC reply carries every device in at most 4 MiB), so it is
+// refused like one that does not parse, and the cache keeps what it had.
+constexpr std::size_t kMaxSummaryBytes = 1024 * 1024;
 
 constexpr const char* kServerVersionCacheKey = "ServerVersionCache";
 constexpr const char* kConversionOutreachScheduledDateKey = "ConversionOutreachScheduledDate";
@@ -267,7 +271,10 @@ void QAXWarrantyDownloader::sendAttempt(const std::string& url, const std::strin
         request, [self, url, serialNumber, retries, completionBlock](HttpResult result) mutable {
             const long status = result.response ? result.response->statusCode : 0;
             std::optional<Value> parsed;
-            if (result.response && !result.response->body.empty()) {
+            if (result.response && result.response->body.size() > kMaxSummaryBytes) {
+                qaxLog().error("Ignoring a coverage answer of %lu bytes (at most %lu)",
+                               result.response->body.size(), kMaxSummaryBytes);
+            } else if (result.response && !result.response->body.empty()) {
                 parsed = parseJson(result.response->body);
             }
             if (parsed) {

@@ -117,4 +117,11 @@ std::shared_ptr<FakeBackgroundActivity> FakeBackgroundActivityScheduler::activit
     return slot;
 }
 
+void FakeBackgroundActivityScheduler::invalidateAll() {
+    std::lock_guard lock(mutex_);
+    for (auto& [identifier, activity] : activities_) {
+        activity->invalidate();
+    }
+}
+
 }  // namespace qax::test

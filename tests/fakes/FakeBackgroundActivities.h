@@ -70,6 +70,8 @@ class FakeBackgroundActivityScheduler : public BackgroundActivityScheduler {
         const std::string& identifier) override;
     // The activity of this identifier, made on first use.
     std::shared_ptr<FakeBackgroundActivity> activity(const std::string& identifier);
+    // Drops every activity's handler (and what it holds), as the test platform goes.
+    void invalidateAll();
 
   private:
     std::mutex mutex_;

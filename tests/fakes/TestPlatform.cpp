@@ -70,6 +70,13 @@ TestPlatform::TestPlatform() {
 }
 
 TestPlatform::~TestPlatform() {
+    // A registered activity keeps its handler, the handler its scheduler, and the scheduler the
+    // activity and this platform (in the agent they all live as long as the process): they go
+    // with the test.
+    if (auto fake =
+            std::dynamic_pointer_cast<FakeBackgroundActivityScheduler>(platform->activities)) {
+        fake->invalidateAll();
+    }
     qaxLog().setSink(previousSink_);
 }
 

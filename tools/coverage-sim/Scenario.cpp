@@ -64,15 +64,24 @@ std::optional<ScenarioStep> parseWords(const std::vector<std::string>& words, st
         }
         return rest;
     }
-    if (word == "ok" || word == "garbage" || word == "array" || word == "hang" || word == "reset") {
+    if (word == "ok" || word == "garbage" || word == "html" || word == "array" || word == "hang") {
         if (hasArgument) {
             return bad("'" + word + "' takes no argument");
         }
         step.kind = word == "ok"        ? ScenarioStep::Kind::Normal
                     : word == "garbage" ? ScenarioStep::Kind::Garbage
+                    : word == "html"    ? ScenarioStep::Kind::Html
                     : word == "array"   ? ScenarioStep::Kind::Array
-                    : word == "hang"    ? ScenarioStep::Kind::Hang
-                                        : ScenarioStep::Kind::Reset;
+                                        : ScenarioStep::Kind::Hang;
+        return step;
+    }
+    if (word == "reset") {
+        auto size = argument(0, kMaxHugeBytes);
+        if (!size) {
+            return bad("reset takes the byte count of the body sent before it");
+        }
+        step.kind = ScenarioStep::Kind::Reset;
+        step.size = *size;
         return step;
     }
     if (word == "deep" || word == "huge") {
@@ -97,8 +106,8 @@ std::optional<ScenarioStep> parseWords(const std::vector<std::string>& words, st
         return step;
     }
     return bad(
-        "not an answer (ok, an HTTP status, delay MS [STEP], garbage, array, deep [LEVELS], "
-        "huge [BYTES], hang, reset)");
+        "not an answer (ok, an HTTP status, delay MS [STEP], garbage, html, array, deep [LEVELS], "
+        "huge [BYTES], hang, reset [BYTES])");
 }
 
 }  // namespace

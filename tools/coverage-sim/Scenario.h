@@ -21,17 +21,19 @@ namespace coveragesim {
 //   "NNN"             that HTTP status with a small JSON error body (100-599)
 //   "delay MS [STEP]" wait MS milliseconds, then STEP (the normal answer when absent)
 //   "garbage"         200 with a body that is neither JSON nor a property list
+//   "html"            200 with an HTML page (text/html), as a captive portal answers
 //   "array"           200 with an array where a dictionary is expected
 //   "deep [LEVELS]"   200 with arrays nested LEVELS deep (default 100000)
 //   "huge [BYTES]"    200 with a body of BYTES (default 64 MiB), streamed
 //   "hang"            no answer until the client goes away
-//   "reset"           the connection is reset without an answer
+//   "reset [BYTES]"   the connection is reset without an answer, or, with BYTES, after the
+//                     headers and the first BYTES of a body announced twice as long
 struct ScenarioStep {
-    enum class Kind { Normal, Status, Garbage, Array, Deep, Huge, Hang, Reset };
+    enum class Kind { Normal, Status, Garbage, Html, Array, Deep, Huge, Hang, Reset };
     Kind kind = Kind::Normal;
     int delayMs = 0;
     int status = 200;
-    std::size_t size = 0;  // levels of "deep", bytes of "huge"
+    std::size_t size = 0;  // levels of "deep", bytes of "huge" and of "reset" before the reset
     std::string text;      // the step as written, normalised
 
     // None with `error` set when the text is not a step.

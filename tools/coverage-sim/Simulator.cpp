@@ -35,6 +35,12 @@ constexpr const char* kSupportBundleId = "com.velmora.support";
 
 constexpr double kHangLimitSeconds = 600;
 constexpr std::size_t kHugeChunkBytes = 64 * 1024;
+constexpr int kResetAfterBodyMs = 100;
+
+// What a captive portal or a misconfigured proxy answers in place of the service.
+constexpr const char* kPortalPage =
+    "<!DOCTYPE html>\n<html><head><title>Sign in to this network</title></head>\n"
+    "<body><form method=\"post\" action=\"/login\"><input name=\"user\"></form></body></html>\n";
 constexpr std::size_t kMaxClockFileBytes = 64 * 1024;
 
 constexpr const char* kJson = "application/json";
@@ -300,6 +306,9 @@ bool Simulator::play(const std::optional<ScenarioStep>& step, BodyFormat format,
         case Kind::Garbage:
             res.set_content("<<< this is not a coverage answer >>>\x01\xff", "text/plain");
             return true;
+        case Kind::Html:
+            res.set_content(kPortalPage, "text/html; charset=utf-8");
+            return true;
         case Kind::Array:
             res.set_content(plist ? *qax::toXmlPlist(Value(Value::Array{"LowServerVersion"}))
                                   : std::string(R"([{"covered":true}])"),
@@ -319,6 +328,11 @@ bool Simulator::play(const std::optional<ScenarioStep>& step, BodyFormat format,
             return true;
         case Kind::Reset: {
             const int fd = findAcceptedSocket(port_, req.remote_port);
+            if (fd >= 0 && step->size > 0) {
+                serveBrokenBody(res, fd, step->size, plist);
+                notes["status"] = 0;
+                return true;
+            }
             if (fd < 0 || !resetConnection(fd)) {
                 // Without the socket, the next best thing: headers, then the body breaks off.
                 res.set_content_provider(
@@ -330,6 +344,26 @@ bool Simulator::play(const std::optional<ScenarioStep>& step, BodyFormat format,
         }
     }
     return false;
+}
+
+void Simulator::serveBrokenBody(httplib::Response& res, int fd, std::size_t size, bool plist) {
+    const std::string start = plist ? std::string(kPlistHeader) + "<dict><key>filler</key><string>"
+                                    : std::string("{\"covered\":true,\"filler\":\"");
+    res.set_content_provider(
+        size * 2, plist ? kPlist : kJson,
+        [this, fd, size, start](std::size_t offset, std::size_t, httplib::DataSink& sink) {
+            if (offset < size) {
+                std::string chunk(std::min(size - offset, kHugeChunkBytes), 'x');
+                for (std::size_t i = 0; i < chunk.size() && offset + i < start.size(); ++i) {
+                    chunk[i] = start[offset + i];
+                }
+                return sink.write(chunk.data(), chunk.size());
+            }
+            // Give the client time to take in the headers and the start of the body.
+            pause(kResetAfterBodyMs);
+            resetConnection(fd);
+            return false;
+        });
 }
 
 void Simulator::versionList(httplib::Response& res) {

@@ -55,6 +55,8 @@ class Simulator {
     bool play(const std::optional<ScenarioStep>& step, BodyFormat format,
               const httplib::Request& req, httplib::Response& res, qax::Value::Dictionary& notes);
     bool pause(int milliseconds);
+    // Headers and `size` bytes of a body announced twice as long, then a reset of `fd`.
+    void serveBrokenBody(httplib::Response& res, int fd, std::size_t size, bool plist);
     std::string fixture(const std::string& name) const;
 
     void versionList(httplib::Response& res);

@@ -50,8 +50,8 @@ constexpr const char* kUsage =
     "\n"
     "KEY: a serial number, \"*\" (any serial without its own list), @versions, @token,\n"
     "@lookup, @purchases. Each request takes the next STEP of its key:\n"
-    "  ok | NNN | delay MS [STEP] | garbage | array | deep [LEVELS] | huge [BYTES] | hang | "
-    "reset\n"
+    "  ok | NNN | delay MS [STEP] | garbage | html | array | deep [LEVELS] | huge [BYTES] |\n"
+    "  hang | reset [BYTES]\n"
     "Admin: GET/POST/DELETE /admin/scenario, GET /admin/requests[?since=N].\n";
 
 int usage(const std::string& problem = "") {
