@@ -253,6 +253,18 @@ TEST_F(AgentServiceTest, QaxctlLaunchEventsASecondAgentAndACleanStop) {
     EXPECT_EQ(st.st_mode & 077, 0u) << std::oct << st.st_mode;
     ASSERT_EQ(::stat(FilePreferenceStore::domainPath(agent.home()).c_str(), &st), 0);
     EXPECT_EQ(st.st_mode & 077, 0u) << std::oct << st.st_mode;
+    // Nor anything else it keeps (certificates are public by nature).
+    int kept = 0;
+    for (const auto& root : {agent.home() + "/Library", agent.platformRoot() + "/state"}) {
+        for (const auto& entry : std::filesystem::recursive_directory_iterator(root)) {
+            if (entry.is_regular_file() && entry.path().extension() != ".pem") {
+                ++kept;
+                ASSERT_EQ(::stat(entry.path().c_str(), &st), 0);
+                EXPECT_EQ(st.st_mode & 077, 0u) << entry.path() << " " << std::oct << st.st_mode;
+            }
+        }
+    }
+    EXPECT_GE(kept, 2);
 
     auto twin = test::runTool(QAX_AGENT_BINARY, {}, agent.environment(), 10);
     EXPECT_EQ(twin.status, 1) << "a second agent on the same socket must not start";

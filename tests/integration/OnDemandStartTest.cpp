@@ -118,5 +118,51 @@ TEST(OnDemandStartTest, IdleExitAndTheNextInstanceKeepStateAndALateClient) {
     ::close(notices);
 }
 
+// The same under the real activator: nothing runs before the first client, the agent exits
+// once idle, and the next connection starts it again with its state kept.
+TEST(OnDemandStartTest, UnderSystemdSocketActivateTheFirstConnectionStartsIt) {
+    const auto activator = test::findProgram("systemd-socket-activate");
+    if (!activator) {
+        GTEST_SKIP() << "systemd-socket-activate (Debian package systemd) is not installed";
+    }
+    test::AgentProcess agent;
+    agent.writeRootFile("device.plist", Value(Value::Dictionary{{"SerialNumber", Value("OD-2")},
+                                                                {"InternalBuild", Value(true)}}));
+    agent.registerApplication("tests", test::selfExecutable(), std::nullopt, Value(true));
+    std::filesystem::create_directories(agent.runtimeDirectory());
+    std::vector<std::string> args{"-l", agent.socketPath(), "-E", "QAX_IDLE_EXIT_SECONDS=1"};
+    for (const auto& variable : agent.environment()) {
+        args.insert(args.end(), {"-E", variable});
+    }
+    args.push_back(QAX_AGENT_BINARY);
+    auto defaultSerial = [&]() -> std::optional<std::string> {
+        HostIpcClient client;
+        std::string error;
+        if (!client.connect(agent.socketPath(), &error)) {
+            return std::nullopt;
+        }
+        auto reply = client.call("defaultDevice:", {}, kWait, &error);
+        return reply && reply->value ? serialIn(&*reply->value) : std::nullopt;
+    };
+
+    for (int instance = 1; instance <= 2; ++instance) {
+        SCOPED_TRACE(instance);
+        const int listening = agent.countInLog("Listening on");
+        test::SpawnedProcess activated(*activator, args, agent.environment(), agent.logPath());
+        ASSERT_TRUE(agent.waitForLog("Listening on", listening + 1, kWait)) << agent.log();
+        EXPECT_EQ(agent.countInLog("Started on demand"), instance - 1)
+            << "nothing starts the agent before a client";
+        EXPECT_EQ(defaultSerial(), instance == 1 ? "OD-2" : "OD-KEPT") << agent.log();
+        if (instance == 1) {
+            auto written = test::runTool(
+                QAX_CTL_BINARY, {"defaults", "write", "SerialNumber", "-string", "OD-KEPT"},
+                agent.environment());
+            ASSERT_EQ(written.status, 0) << written.err;
+        }
+        EXPECT_TRUE(exitedCleanly(activated.waitForExit(kWait))) << agent.log();
+        EXPECT_EQ(agent.countInLog(kExitedIdle), instance);
+    }
+}
+
 }  // namespace
 }  // namespace qax
