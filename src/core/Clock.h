@@ -18,6 +18,11 @@ class Clock {
     virtual int secondsFromGMT(Date at) const = 0;
 };
 
+// The wall clock that file systems stamp modification times with, in nanoseconds since 1970:
+// for comparing with those times only. A simulated clock must not move it. (Defined with the
+// host's SystemClock, the one other reader of the wall clock.)
+long long fileSystemTimeNs();
+
 // A clock that only moves when told to: tests and the virtual-time task runner.
 class ManualClock : public Clock {
   public:

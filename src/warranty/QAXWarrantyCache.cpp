@@ -14,6 +14,7 @@
 #include <unordered_map>
 
 #include "core/AtomicFile.h"
+#include "core/Clock.h"
 #include "core/Hash.h"
 #include "core/Log.h"
 #include "core/PlistCodec.h"
@@ -74,7 +75,7 @@ class ParsedFiles {
         }
         // Read after the stat: a file replaced in between is newer than the identity kept
         // with it, so the next stat sees the change and reads it again.
-        const long long readNs = realTimeNs();
+        const long long readNs = fileSystemTimeNs();
         std::optional<Value> value;
         if (auto bytes = readWholeFile(path, kMaxPlistBytes)) {
             value = parsePlist(*bytes);
@@ -121,12 +122,6 @@ class ParsedFiles {
     static long long toNs(const timespec& t) { return t.tv_sec * 1'000'000'000LL + t.tv_nsec; }
     static Identity identityOf(const struct stat& st) {
         return {st.st_dev, st.st_ino, st.st_size, toNs(st.st_mtim), toNs(st.st_ctim)};
-    }
-    // The file system's clock, not the agent's: file times are compared with it.
-    static long long realTimeNs() {
-        timespec now{};
-        clock_gettime(CLOCK_REALTIME, &now);
-        return toNs(now);
     }
 
     std::mutex mutex_;

@@ -6,6 +6,12 @@
 
 namespace qax {
 
+long long fileSystemTimeNs() {
+    timespec now{};
+    clock_gettime(CLOCK_REALTIME, &now);
+    return now.tv_sec * 1'000'000'000LL + now.tv_nsec;
+}
+
 Date SystemClock::now() const {
     using namespace std::chrono;
     return Date(duration<double>(system_clock::now().time_since_epoch()).count());
