@@ -40,6 +40,8 @@ class FollowUpActivitiesTest : public ::testing::Test {
         qax_registerDefaults(prefs);
         factory().setAgent(agent);
     }
+    // The agent's infos hold warranties, which hold the platform, which holds the agent.
+    ~FollowUpActivitiesTest() override { agent->setInfos({}); }
     test::FakeAgentFactory& factory() {
         return static_cast<test::FakeAgentFactory&>(*tp.platform->agentFactory);
     }
