@@ -90,6 +90,7 @@ TEST_F(AgentServiceTest, EntitledClientsAreServedAndOthersClosed) {
         "dismissFollowUpForSerialNumber:completion:", {Value("ITEST-SN-1")}, kWait, &error);
     ASSERT_TRUE(dismissed) << error;
     EXPECT_EQ(dismissed->value, Value(true));
+    EXPECT_EQ(agent.log().find("ITEST-SN-1"), std::string::npos) << agent.log();
 
     // A second client at once gets its own agent (both fall back to the settings name).
     auto second = connect();
