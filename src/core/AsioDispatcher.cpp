@@ -6,6 +6,8 @@
 #include <asio.hpp>
 #include <atomic>
 #include <chrono>
+#include <condition_variable>
+#include <deque>
 #include <mutex>
 #include <thread>
 #include <vector>
@@ -44,53 +46,87 @@ class AsioRunner : public TaskRunner {
     Executor ex_;
 };
 
-// A thread pool whose threads start with the first task: most runs of the daemon never do
-// blocking work, and idle threads cost memory.
-class LazyPoolRunner : public TaskRunner {
+// The pool for blocking work. A thread starts only when a task finds no idle one (up to a
+// limit), and a thread left idle for a while ends: most of the daemon's life needs none, and
+// idle threads cost memory. Delayed tasks wait on a timer of `timers` and are then queued here.
+class ElasticPoolRunner : public TaskRunner,
+                          public std::enable_shared_from_this<ElasticPoolRunner> {
   public:
-    explicit LazyPoolRunner(unsigned threads) : threads_(std::max(1u, threads)) {}
+    ElasticPoolRunner(unsigned maxThreads, asio::thread_pool::executor_type timers)
+        : max_(std::max(1u, maxThreads)), timers_(std::move(timers)) {}
 
     void post(Task task) override {
-        if (auto* pool = started()) {
-            asio::post(*pool, std::move(task));
+        std::lock_guard lock(mutex_);
+        if (stopped_) {
+            return;
+        }
+        queue_.push_back(std::move(task));
+        if (idle_ >= queue_.size()) {
+            wake_.notify_one();
+        } else if (running_ < max_) {
+            ++running_;
+            std::thread([self = shared_from_this()] { self->work(); }).detach();
         }
     }
 
     void postDelayed(Task task, double seconds) override {
         if (seconds <= 0) {
-            post(std::move(task));
-        } else if (auto* pool = started()) {
-            postDelayedOn(pool->get_executor(), std::move(task), seconds);
+            return post(std::move(task));
         }
+        postDelayedOn(
+            timers_,
+            [weak = weak_from_this(), task = std::move(task)]() mutable {
+                if (auto self = weak.lock()) {
+                    self->post(std::move(task));
+                }
+            },
+            seconds);
     }
 
+    // Drops what has not started and waits for the tasks that run.
     void shutdown() {
-        std::unique_ptr<asio::thread_pool> pool;
-        {
-            std::lock_guard lock(mutex_);
-            stopped_ = true;
-            pool = std::move(pool_);
-        }
-        if (pool) {
-            pool->stop();
-            pool->join();
-        }
+        std::unique_lock lock(mutex_);
+        stopped_ = true;
+        queue_.clear();
+        wake_.notify_all();
+        ended_.wait(lock, [this] { return running_ == 0; });
     }
 
   private:
-    // The pool, started now if need be; none once shut down (the task is dropped, as a
-    // stopped pool would drop it).
-    asio::thread_pool* started() {
-        std::lock_guard lock(mutex_);
-        if (!pool_ && !stopped_) {
-            pool_ = std::make_unique<asio::thread_pool>(threads_);
+    void work() {
+        pthread_setname_np(pthread_self(), "qax-blocking");
+        std::unique_lock lock(mutex_);
+        for (;;) {
+            if (!stopped_ && queue_.empty()) {
+                ++idle_;
+                const bool woken = wake_.wait_for(lock, kIdleLifetime,
+                                                  [this] { return stopped_ || !queue_.empty(); });
+                --idle_;
+                if (!woken) {
+                    break;
+                }
+            }
+            if (stopped_) {
+                break;
+            }
+            Task task = std::move(queue_.front());
+            queue_.pop_front();
+            lock.unlock();
+            task();
+            task = nullptr;
+            lock.lock();
         }
-        return pool_.get();
+        --running_;
+        ended_.notify_all();
     }
 
-    const unsigned threads_;
+    static constexpr std::chrono::seconds kIdleLifetime{10};
+    const unsigned max_;
+    asio::thread_pool::executor_type timers_;
     std::mutex mutex_;
-    std::unique_ptr<asio::thread_pool> pool_;
+    std::condition_variable wake_, ended_;
+    std::deque<Task> queue_;
+    unsigned running_ = 0, idle_ = 0;
     bool stopped_ = false;
 };
 
@@ -123,7 +159,7 @@ struct AsioDispatcher::State {
         : work(asio::make_work_guard(main)),
           ioThreadCount(io),
           pool(background),
-          blockingRunner(std::make_shared<LazyPoolRunner>(blocking)) {}
+          blockingRunner(std::make_shared<ElasticPoolRunner>(blocking, pool.get_executor())) {}
     asio::io_context main;
     asio::executor_work_guard<asio::io_context::executor_type> work;
 
@@ -136,7 +172,7 @@ struct AsioDispatcher::State {
     std::atomic<unsigned> nextIoThread{0};
 
     asio::thread_pool pool;
-    std::shared_ptr<LazyPoolRunner> blockingRunner;
+    std::shared_ptr<ElasticPoolRunner> blockingRunner;
 };
 
 unsigned AsioDispatcher::hardwareThreads() {

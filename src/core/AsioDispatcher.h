@@ -1,7 +1,7 @@
 // The daemon's queues on Asio: the main queue is an io_context run by the main thread, the
 // background queue is a thread pool, serial queues are strands on that pool, blocking work
-// gets a pool of its own (started on first use), and client sockets live on I/O threads,
-// each running its own io_context. Thread-safe.
+// gets a pool of its own (threads start on demand and end when idle), and client sockets live
+// on I/O threads, each running its own io_context. Thread-safe.
 #pragma once
 
 #include <asio/any_io_executor.hpp>

@@ -114,7 +114,7 @@ HostAccountStore::HostAccountStore(const std::string& platformRoot,
     : shared_(std::make_shared<Shared>()),
       file_((fs::path(platformRoot) / "accounts.plist").string()),
       http_(std::move(http)),
-      dispatcher_(std::move(dispatcher)) {
+      queue_(dispatcher ? dispatcher->makeSerialQueue("account-store") : nullptr) {
     shared_->path = file_.path();
     shared_->lockPath = (fs::path(platformRoot) / "state" / ".accounts.lock").string();
 }
@@ -197,8 +197,8 @@ void HostAccountStore::renewCredentialsForAccount(
         }
         completion(0, std::nullopt);
     };
-    if (dispatcher_) {
-        dispatcher_->blockingQueue()->post(std::move(renew));
+    if (queue_) {
+        queue_->post(std::move(renew));
     } else {
         renew();
     }
@@ -219,8 +219,8 @@ void HostAccountStore::authenticateSilently(
             completion(nullptr, std::string("no store account can be authenticated silently"));
         }
     };
-    if (dispatcher_) {
-        dispatcher_->blockingQueue()->post(std::move(answer));
+    if (queue_) {
+        queue_->post(std::move(answer));
     } else {
         answer();
     }

@@ -3,8 +3,8 @@
 // SilentAuthStoreAccount {storefront, accountID}. A missing section means no such account.
 // Renewal asks the token service when the file names one (POST {"altDSID", "services"},
 // answer {"token"}), else mints a random token; either way the token is written back to
-// the file atomically. Thread-safe; completions run on the HTTP session's thread or on the
-// dispatcher's blocking queue, never on the caller's thread.
+// the file atomically. Thread-safe; completions run on the HTTP session's thread or on a
+// serial queue of the store's own, never on the caller's thread.
 #pragma once
 
 #include <memory>
@@ -51,7 +51,10 @@ class HostAccountStore : public AccountStore {
     std::shared_ptr<Shared> shared_;
     CachedPlistFile file_;
     std::shared_ptr<HttpClient> http_;
-    std::shared_ptr<Dispatcher> dispatcher_;
+    // Where renewals and silent authentications answer (none: on the caller's thread). A
+    // serial queue of its own, never the blocking pool: signers wait on that pool for these
+    // very answers and may hold all of its threads.
+    std::shared_ptr<TaskRunner> queue_;
 };
 
 }  // namespace qax
