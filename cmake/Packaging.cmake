@@ -55,8 +55,10 @@ set(CPACK_DEBIAN_FILE_NAME DEB-DEFAULT)
 set(CPACK_DEBIAN_PACKAGE_SECTION utils)
 set(CPACK_DEBIAN_PACKAGE_SHLIBDEPS ON)
 # The agent trusts the system's CAs for the coverage service; the units need the service manager.
-# libcurl is loaded on first use (dlopen), so dpkg-shlibdeps cannot see it: it is named here.
-set(CPACK_DEBIAN_PACKAGE_DEPENDS "ca-certificates, libcurl4 (>= 7.88)")
+# libcurl and ICU are loaded on first use (dlopen), so dpkg-shlibdeps cannot see them: they are
+# named here. ICU's package carries the major version the agent was built against.
+string(REGEX MATCH "^[0-9]+" QAX_ICU_MAJOR "${ICU_VERSION}")
+set(CPACK_DEBIAN_PACKAGE_DEPENDS "ca-certificates, libcurl4 (>= 7.88), libicu${QAX_ICU_MAJOR}")
 set(CPACK_DEBIAN_PACKAGE_RECOMMENDS "systemd")
 set(CPACK_DEBIAN_PACKAGE_CONTROL_EXTRA
     ${PROJECT_SOURCE_DIR}/share/debian/postinst

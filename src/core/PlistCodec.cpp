@@ -1,7 +1,6 @@
 #include "core/PlistCodec.h"
 
 #include <plist/plist.h>
-#include <unicode/ustring.h>
 
 #include <algorithm>
 #include <cmath>
@@ -10,6 +9,8 @@
 #include <limits>
 #include <memory>
 #include <vector>
+
+#include "core/IcuLibrary.h"
 
 namespace qax {
 namespace {
@@ -233,18 +234,22 @@ std::string utf8FromPlist(const char* p, std::size_t n) {
     if (std::all_of(bytes, bytes + n, [](unsigned char c) { return c < 0x80; })) {
         return std::string(p, n);
     }
+    const IcuLibrary* icu = IcuLibrary::get();
+    if (!icu) {
+        return std::string(p, n);
+    }
     UErrorCode status = U_ZERO_ERROR;
     int32_t units = 0, substitutions = 0;
     std::u16string wide(n, u'\0');
-    u_strFromUTF8WithSub(wide.data(), static_cast<int32_t>(wide.size()), &units, p,
-                         static_cast<int32_t>(n), 0xFFFD, &substitutions, &status);
+    icu->strFromUTF8WithSub(wide.data(), static_cast<int32_t>(wide.size()), &units, p,
+                            static_cast<int32_t>(n), 0xFFFD, &substitutions, &status);
     if (U_FAILURE(status) || substitutions == 0) {
         return std::string(p, n);
     }
     std::string text(static_cast<std::size_t>(units) * 3, '\0');
     int32_t length = 0;
-    u_strToUTF8(text.data(), static_cast<int32_t>(text.size()), &length, wide.data(), units,
-                &status);
+    icu->strToUTF8(text.data(), static_cast<int32_t>(text.size()), &length, wide.data(), units,
+                   &status);
     text.resize(U_SUCCESS(status) ? static_cast<std::size_t>(length) : 0);
     return text;
 }

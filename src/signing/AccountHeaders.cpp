@@ -1,14 +1,15 @@
 #include "signing/AccountHeaders.h"
 
 #include <openssl/rand.h>
-#include <unicode/ustring.h>
 
+#include <algorithm>
 #include <chrono>
 #include <condition_variable>
 #include <cstdint>
 #include <cstdio>
 #include <mutex>
 
+#include "core/IcuLibrary.h"
 #include "core/JsonCodec.h"
 #include "core/Log.h"
 #include "core/Value.h"
@@ -99,9 +100,16 @@ std::string randomUUIDString() {
 }
 
 bool isValidUTF8(const std::string& text) {
+    if (std::all_of(text.begin(), text.end(), [](char c) { return (c & 0x80) == 0; })) {
+        return true;
+    }
+    const IcuLibrary* icu = IcuLibrary::get();
+    if (!icu) {
+        return false;
+    }
     UErrorCode status = U_ZERO_ERROR;
     int32_t length = 0;
-    u_strFromUTF8(nullptr, 0, &length, text.data(), static_cast<int32_t>(text.size()), &status);
+    icu->strFromUTF8(nullptr, 0, &length, text.data(), static_cast<int32_t>(text.size()), &status);
     return status == U_BUFFER_OVERFLOW_ERROR || status == U_STRING_NOT_TERMINATED_WARNING ||
            U_SUCCESS(status);
 }

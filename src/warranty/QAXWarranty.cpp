@@ -1,13 +1,12 @@
 #include "warranty/QAXWarranty.h"
 
-#include <unicode/locid.h>
-#include <unicode/numfmt.h>
-#include <unicode/unistr.h>
-
 #include <cmath>
+#include <iterator>
 #include <limits>
+#include <memory>
 #include <vector>
 
+#include "core/IcuLibrary.h"
 #include "core/Log.h"
 #include "platform/LocaleInfo.h"
 #include "platform/Platform.h"
@@ -178,25 +177,38 @@ std::uint64_t asUnsigned64(const Value& number) {
 // The count in the user's locale: its digits and grouping separators. Formatters are
 // costly to make, so each thread keeps the last one it made.
 std::string formatCount(std::uint32_t count, const std::string& localeIdentifier) {
+    const IcuLibrary* icu = IcuLibrary::get();
+    if (!icu) {
+        return std::to_string(count);
+    }
+    struct Close {
+        void operator()(UNumberFormat* f) const { IcuLibrary::get()->numberFormatClose(f); }
+    };
     struct CachedFormatter {
         std::string localeIdentifier;
-        std::unique_ptr<icu::NumberFormat> formatter;
+        std::unique_ptr<UNumberFormat, Close> formatter;
     };
     thread_local CachedFormatter cached;
     if (!cached.formatter || cached.localeIdentifier != localeIdentifier) {
         UErrorCode status = U_ZERO_ERROR;
-        std::unique_ptr<icu::NumberFormat> formatter(
-            icu::NumberFormat::createInstance(icu::Locale(localeIdentifier.c_str()), status));
+        std::unique_ptr<UNumberFormat, Close> formatter(icu->numberFormatOpen(
+            UNUM_DECIMAL, nullptr, 0, localeIdentifier.c_str(), nullptr, &status));
         if (U_FAILURE(status) || !formatter) {
             return std::to_string(count);
         }
         cached = {localeIdentifier, std::move(formatter)};
     }
-    icu::UnicodeString text;
-    cached.formatter->format(static_cast<std::int64_t>(count), text);
-    std::string out;
-    text.toUTF8String(out);
-    return out;
+    UChar digits[64];
+    UErrorCode status = U_ZERO_ERROR;
+    const int32_t units = icu->numberFormatInt64(cached.formatter.get(), count, digits,
+                                                 std::size(digits), nullptr, &status);
+    char text[256];
+    int32_t length = 0;
+    if (U_SUCCESS(status)) {
+        icu->strToUTF8(text, sizeof text, &length, digits, units, &status);
+    }
+    return U_SUCCESS(status) ? std::string(text, static_cast<std::size_t>(length))
+                             : std::to_string(count);
 }
 
 // Puts `argument` in place of the format's object placeholder ("%@", or "%1$@" in
