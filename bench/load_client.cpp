@@ -1,6 +1,7 @@
 // The load client: starts a real qaxagent (and coverage-sim for its downloads) on a temporary
 // home and measures, in one run:
-//  - start-up to listening, and the idle daemon's resident memory;
+//  - start-up to listening, the resident memory after the first launch and that of the idle
+//    daemon (started again, its first-launch work done);
 //  - the round trip of a bare echo over a Unix socket (the floor: prebuilt frame bytes written
 //    back by a server that parses nothing, read back by a client that decodes nothing) and,
 //    with the same kind of prebuilt request bytes, the agent's "defaultDevice:",
@@ -398,7 +399,8 @@ int main(int argc, char** argv) {
         std::printf("start-up to listening            %8.1f ms (process spawn included)\n",
                     secondsSince(t0) * 1e3);
         std::this_thread::sleep_for(std::chrono::milliseconds(300));
-        std::printf("resident memory, idle            %8ld kB (%ld threads)\n",
+        std::printf("resident memory, first launch    %8ld kB (%ld threads; its first outreach "
+                    "included)\n",
                     statusKilobytes(agent->pid(), "VmRSS"),
                     statusKilobytes(agent->pid(), "Threads"));
 
@@ -413,6 +415,17 @@ int main(int argc, char** argv) {
         std::printf("warranty cache written           %zu of %zu devices %s\n", warranties, infos,
                     error.c_str());
     }  // coverage-sim stops: from here on nothing reaches the network
+
+    // The daemon as it usually is: started again (on demand, after its first-launch work),
+    // with nothing to do.
+    agent->stop();
+    if (!agent->start()) {
+        std::fprintf(stderr, "qaxagent did not start again:\n%s\n", agent->log().c_str());
+        return 1;
+    }
+    std::this_thread::sleep_for(std::chrono::milliseconds(300));
+    std::printf("resident memory, idle            %8ld kB (%ld threads)\n",
+                statusKilobytes(agent->pid(), "VmRSS"), statusKilobytes(agent->pid(), "Threads"));
 
     std::vector<Operation> ops;
     ops.push_back({kDefaultDevice, requestFrame(kDefaultDevice, {}), {}, {}});
