@@ -144,6 +144,14 @@ TEST_F(HostAccountStoreTest, RenewalWithoutTokenServiceMintsAndStoresAToken) {
     EXPECT_NE(token, "old-token");
     EXPECT_EQ(store.credentialTokenForAccount(*kf, kService), token);
 
+    // Signers wait for renewals on the blocking pool: the answer must not need a thread of
+    // that pool (here its only one).
+    std::promise<long> fromBlocking;
+    dispatcher->blockingQueue()->post([&] { fromBlocking.set_value(renew(store, *kf).code); });
+    auto code = fromBlocking.get_future();
+    ASSERT_EQ(code.wait_for(30s), std::future_status::ready);
+    EXPECT_EQ(code.get(), 0);
+
     // The rest of the file is kept, and the file is private to its owner.
     auto root = parsePlist(test::readFile(file));
     EXPECT_EQ(*root->find("IdentityHeaders"), *accountsFile(std::nullopt).find("IdentityHeaders"));
