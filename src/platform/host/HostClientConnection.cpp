@@ -18,8 +18,9 @@ namespace {
 constexpr auto kIncompleteRequestTimeout = std::chrono::seconds(60);
 // Beyond this many unanswered requests the connection stops reading until replies go out.
 constexpr int kMaxRequestsInFlight = 64;
-// Bytes are read into a buffer of the reading thread, shared by all its connections; a large
-// frame accumulates in the connection's decoder over several reads.
+// Beyond what the connection's own small buffer takes, bytes are read into a buffer of the
+// reading thread, shared by all its connections; a large frame accumulates in the
+// connection's decoder over several reads.
 constexpr std::size_t kReadChunkBytes = 64 * 1024;
 
 constexpr const char* kIdKey = "id";
@@ -97,37 +98,37 @@ void HostClientConnection::readMore() {
         idleTimer_.cancel();
         decoder_.release();
     }
-    // Waiting for readability rather than reading into a buffer of our own: an idle
-    // connection then holds no buffer.
-    socket_.async_wait(Socket::wait_read, [self = shared_from_this()](const asio::error_code& ec) {
-        self->reading_ = false;
-        if (ec) {
-            // Closed here, or cancelled: nothing more to read.
-            self->closeNow();
-            return;
-        }
-        // The request's log lines go out together, after its reply, and it sees each file it
-        // reads as it was at its first look.
-        LogBatch batch;
-        FileSnapshotScope snapshot;
-        self->readAvailable();
-    });
+    // Reading as the socket becomes readable (rather than waiting for readability and then
+    // reading) costs no re-registration with the reactor per request.
+    socket_.async_read_some(
+        asio::buffer(readBuffer_),
+        [self = shared_from_this()](const asio::error_code& ec, std::size_t n) {
+            self->reading_ = false;
+            if (ec) {
+                // The end of the stream, a reset, or cancelled: nothing more to read.
+                self->closeNow();
+                return;
+            }
+            // The request's log lines go out together, after its reply, and it sees each file
+            // it reads as it was at its first look.
+            LogBatch batch;
+            FileSnapshotScope snapshot;
+            if (n < self->readBuffer_.size()) {
+                self->handleBytes(std::string_view(self->readBuffer_.data(), n));
+                return;
+            }
+            self->decoder_.append(std::string_view(self->readBuffer_.data(), n));
+            self->readAvailable();
+        });
 }
 
 void HostClientConnection::readAvailable() {
     thread_local std::vector<char> buffer(kReadChunkBytes);
     asio::error_code ec;
     const std::size_t n = socket_.read_some(asio::buffer(buffer), ec);
-    if (ec == asio::error::would_block || ec == asio::error::try_again) {
-        readMore();
-        return;
-    }
-    if (ec) {
-        // End of stream or a reset: the client went away.
-        closeNow();
-        return;
-    }
-    handleBytes(std::string_view(buffer.data(), n));
+    // Nothing more yet, the end of the stream or a reset: what has arrived is handled first,
+    // and the next read meets the end again.
+    handleBytes(ec ? std::string_view() : std::string_view(buffer.data(), n));
 }
 
 void HostClientConnection::armIdleTimer() {

@@ -6,12 +6,14 @@
 // from any thread and in any order; they are encoded on the replying thread and written from
 // the strand. The peer facts and the exported interface and object are set by the listener
 // before resume() and guarded by a mutex. The connection keeps the process alive (its
-// lifecycle transaction) until it is closed. An idle connection holds no read buffer: bytes
-// are read into a buffer of the I/O thread, and only an incomplete frame is kept.
+// lifecycle transaction) until it is closed. An idle connection holds a small read buffer
+// (a usual request fits it); more bytes are read into a buffer of the I/O thread, and only an
+// incomplete frame is kept.
 #pragma once
 
 #include <sys/types.h>
 
+#include <array>
 #include <asio/local/stream_protocol.hpp>
 #include <asio/steady_timer.hpp>
 #include <cstdint>
@@ -53,6 +55,7 @@ class HostClientConnection : public ClientConnection,
   private:
     // Waits for the socket to become readable (unless paused, waiting already or closed).
     void readMore();
+    // After a read filled the connection's own buffer: reads what else waits, then handles it.
     void readAvailable();
     void handleBytes(std::string_view bytes);
     // False when the connection had to be closed.
@@ -76,6 +79,9 @@ class HostClientConnection : public ClientConnection,
     // On the strand only.
     std::shared_ptr<void> transaction_;
     IpcFrameCodec decoder_;
+    // Where the socket is read as it becomes readable: a usual request arrives whole here,
+    // a larger one goes on through the reading thread's shared buffer.
+    std::array<char, 512> readBuffer_;
     std::deque<std::string> writeQueue_;
     bool reading_ = false;
     // Inside handleBytes(): a reply given there does not resume reading, the loop does.
