@@ -2,6 +2,8 @@
 
 #include <sys/stat.h>
 
+#include <cerrno>
+
 #include "core/AtomicFile.h"
 #include "core/FileSnapshotScope.h"
 #include "core/Log.h"
@@ -9,21 +11,29 @@
 
 namespace qax {
 
-std::optional<Value> CachedPlistFile::read() {
+std::optional<Value> CachedPlistFile::read(bool* present) {
     const std::uint64_t scope = FileSnapshotScope::current();
     if (scope != 0) {
         std::lock_guard lock(mutex_);
         if (loaded_ && scope == checkedInScope_) {
+            if (present) {
+                *present = present_;
+            }
             return value_;  // looked at already during this piece of work
         }
     }
     struct stat st {};
     const bool exists = ::stat(path_.c_str(), &st) == 0;
+    const bool there = exists || (errno != ENOENT && errno != ENOTDIR);
+    if (present) {
+        *present = there;
+    }
     const long long mtimeNs =
         exists ? static_cast<long long>(st.st_mtim.tv_sec) * 1'000'000'000LL + st.st_mtim.tv_nsec
                : -1;
     std::lock_guard lock(mutex_);
     checkedInScope_ = scope;
+    present_ = there;
     if (loaded_ && (exists ? (st.st_dev == dev_ && st.st_ino == ino_ && st.st_size == size_ &&
                               mtimeNs == mtimeNs_)
                            : size_ == -1)) {

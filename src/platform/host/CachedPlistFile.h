@@ -19,7 +19,9 @@ class CachedPlistFile {
   public:
     explicit CachedPlistFile(std::string path) : path_(std::move(path)) {}
 
-    std::optional<Value> read();
+    // `present`, when given, says whether the file is there, or cannot be looked at for
+    // another reason than its absence (an unreadable file is not a missing one).
+    std::optional<Value> read(bool* present = nullptr);
     const std::string& path() const { return path_; }
 
   private:
@@ -30,6 +32,7 @@ class CachedPlistFile {
     ino_t ino_ = 0;
     off_t size_ = -1;
     long long mtimeNs_ = -1;
+    bool present_ = false;
     std::optional<Value> value_;
     // The FileSnapshotScope in which the file was last looked at.
     std::uint64_t checkedInScope_ = 0;

@@ -1,6 +1,5 @@
 #include "platform/host/HostDeviceProperties.h"
 
-#include <sys/stat.h>
 #include <sys/utsname.h>
 
 #include <algorithm>
@@ -84,15 +83,12 @@ HostDeviceProperties::HostDeviceProperties(const std::string& platformRoot,
       osReleasePath_(std::move(osReleasePath)),
       dmiDirectory_(std::move(dmiDirectory)) {}
 
-bool HostDeviceProperties::deviceFileExists() const {
-    struct stat st {};
-    return ::stat(file_.path().c_str(), &st) == 0 || (errno != ENOENT && errno != ENOTDIR);
-}
-
 std::optional<Value> HostDeviceProperties::copyDeviceProperty(std::string_view name) {
-    if (deviceFileExists()) {
+    bool present = false;
+    auto root = file_.read(&present);
+    if (present) {
         // A file that is there but unreadable describes no device rather than this machine.
-        if (auto root = file_.read()) {
+        if (root) {
             if (const Value* v = root->find(name)) {
                 return *v;
             }

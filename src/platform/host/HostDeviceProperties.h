@@ -30,7 +30,6 @@ class HostDeviceProperties : public DeviceProperties {
         std::optional<std::string> systemVersion;
     };
 
-    bool deviceFileExists() const;
     const MachineFacts& machine();
     MachineFacts readMachineFacts() const;
     // Read only when asked for: a machine without one logs it once.
