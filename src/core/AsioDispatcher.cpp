@@ -130,6 +130,78 @@ class ElasticPoolRunner : public TaskRunner,
     bool stopped_ = false;
 };
 
+// The I/O context run by this thread, if it is an I/O thread.
+thread_local asio::io_context* currentIoContext = nullptr;
+
+// A serial queue whose tasks run where the work that queues them runs: posted from an I/O
+// thread, they run on that thread's loop after the current handler (a request's follow-on
+// work then wakes no other thread); posted from anywhere else, on the background pool. Tasks
+// run one at a time, in order. Work queued here must not block.
+class FollowingSerialQueue : public TaskRunner,
+                             public std::enable_shared_from_this<FollowingSerialQueue> {
+  public:
+    explicit FollowingSerialQueue(asio::thread_pool::executor_type pool) : pool_(std::move(pool)) {}
+
+    void post(Task task) override {
+        {
+            std::lock_guard lock(mutex_);
+            tasks_.push_back(std::move(task));
+            if (scheduled_) {
+                return;
+            }
+            scheduled_ = true;
+        }
+        schedule();
+    }
+
+    void postDelayed(Task task, double seconds) override {
+        if (seconds <= 0) {
+            return post(std::move(task));
+        }
+        postDelayedOn(
+            pool_,
+            [self = shared_from_this(), task = std::move(task)]() mutable {
+                self->post(std::move(task));
+            },
+            seconds);
+    }
+
+  private:
+    void schedule() {
+        auto run = [self = shared_from_this()] { self->runSome(); };
+        if (currentIoContext && !currentIoContext->stopped()) {
+            asio::post(*currentIoContext, std::move(run));
+        } else {
+            asio::post(pool_, std::move(run));
+        }
+    }
+
+    // Runs what is queued, a bounded number at a time so that one busy queue does not hold a
+    // thread other work waits for.
+    void runSome() {
+        for (int i = 0; i < kTasksPerTurn; ++i) {
+            Task task;
+            {
+                std::lock_guard lock(mutex_);
+                if (tasks_.empty()) {
+                    scheduled_ = false;
+                    return;
+                }
+                task = std::move(tasks_.front());
+                tasks_.pop_front();
+            }
+            task();
+        }
+        schedule();
+    }
+
+    static constexpr int kTasksPerTurn = 16;
+    asio::thread_pool::executor_type pool_;
+    std::mutex mutex_;
+    std::deque<Task> tasks_;
+    bool scheduled_ = false;
+};
+
 // One thread running one io_context. The context is made for a single thread, so its loop
 // never hands a ready socket to another thread: the thread that waited for the socket runs the
 // handler.
@@ -137,6 +209,7 @@ struct IoThread {
     IoThread() : io(1), work(asio::make_work_guard(io)) {
         thread = std::thread([this] {
             pthread_setname_np(pthread_self(), "qax-ipc");
+            currentIoContext = &io;
             io.run();
         });
     }
@@ -194,8 +267,7 @@ AsioDispatcher::~AsioDispatcher() {
 }
 
 std::shared_ptr<TaskRunner> AsioDispatcher::makeSerialQueue(std::string) {
-    using Strand = asio::strand<asio::thread_pool::executor_type>;
-    return std::make_shared<AsioRunner<Strand>>(asio::make_strand(state_->pool.get_executor()));
+    return std::make_shared<FollowingSerialQueue>(state_->pool.get_executor());
 }
 
 AsioDispatcher::IoStrand AsioDispatcher::makeIoStrand() {

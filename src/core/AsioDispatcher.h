@@ -1,5 +1,6 @@
 // The daemon's queues on Asio: the main queue is an io_context run by the main thread, the
-// background queue is a thread pool, serial queues are strands on that pool, blocking work
+// background queue is a thread pool, serial queues run their tasks one at a time on the I/O
+// thread that queued them or else on that pool (never blocking there), blocking work
 // gets a pool of its own (threads start on demand and end when idle), and client sockets live
 // on I/O threads, each running its own io_context. Thread-safe.
 #pragma once
