@@ -274,21 +274,22 @@ bool holdsOnlyArchivableKinds(const Value& root) {
 }  // namespace
 
 std::shared_ptr<QAXWarranty> QAXWarranty::warrantyWithDictionary(
-    std::shared_ptr<Platform> platform, const std::optional<Value>& dictionary,
+    std::shared_ptr<Platform> platform, std::optional<Value> dictionary,
     const std::optional<std::string>& serialNumber) {
     static constexpr const char* kOperation = "+[QAXWarranty warrantyWithDictionary:serialNumber:]";
-    auto warranty = initWithDictionary(std::move(platform), dictionary, serialNumber);
+    auto warranty = initWithDictionary(std::move(platform), std::move(dictionary), serialNumber);
     qaxLog().info("%s : %d", kOperation, warranty ? 1 : 0);
     return warranty;
 }
 
 std::shared_ptr<QAXWarranty> QAXWarranty::initWithDictionary(
-    std::shared_ptr<Platform> platform, const std::optional<Value>& dictionary,
+    std::shared_ptr<Platform> platform, std::optional<Value> dictionary,
     const std::optional<std::string>& serialNumber) {
     if (!dictionary || !dictionary->isDictionary()) {
         return nullptr;
     }
-    return std::make_shared<QAXWarranty>(std::move(platform), *dictionary, serialNumber);
+    return std::make_shared<QAXWarranty>(std::move(platform), std::move(*dictionary),
+                                         serialNumber);
 }
 
 QAXWarranty::QAXWarranty(std::shared_ptr<Platform> platform, Value dictionary,

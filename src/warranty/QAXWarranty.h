@@ -22,12 +22,12 @@ class QAXWarranty {
     // Builds the record from a coverage summary (a dictionary; anything else yields no
     // record) and logs whether one was made. The serial number is accepted and not kept.
     static std::shared_ptr<QAXWarranty> warrantyWithDictionary(
-        std::shared_ptr<Platform> platform, const std::optional<Value>& dictionary,
+        std::shared_ptr<Platform> platform, std::optional<Value> dictionary,
         const std::optional<std::string>& serialNumber = std::nullopt);
 
     // The same without the log line: none for a missing or non-dictionary value.
     static std::shared_ptr<QAXWarranty> initWithDictionary(
-        std::shared_ptr<Platform> platform, const std::optional<Value>& dictionary,
+        std::shared_ptr<Platform> platform, std::optional<Value> dictionary,
         const std::optional<std::string>& serialNumber = std::nullopt);
 
     // Fills every field from `dictionary`. The platform supplies the preference store (the
