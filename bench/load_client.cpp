@@ -6,7 +6,8 @@
 //    back by a server that parses nothing, read back by a client that decodes nothing) and,
 //    with the same kind of prebuilt request bytes, the agent's "defaultDevice:",
 //    "pairedDevices:" and cached-only all-device-infos for 3 devices, as ratios to the floor.
-//    Echo and agent batches alternate, so both see the same load on a shared machine;
+//    Echo and agent batches alternate, so both see the same load on a shared machine; once
+//    where the scheduler puts the threads, once with client, echo server and agent on one core;
 //  - throughput with 1, 2, 4 and 8 clients, and the agent's CPU time per request;
 //  - 1,000 connections held at once, each answered, and the resident memory they add;
 //  - a forced download of 10 devices against coverage-sim answering after 200 ms, against
@@ -17,6 +18,7 @@
 //        qax_load --hold device|paired|cached SECONDS CLIENTS
 //          (only keeps the agent busy with one operation, for a profiler attached to the pid
 //          it prints)
+#include <sched.h>
 #include <sys/resource.h>
 #include <sys/socket.h>
 #include <sys/un.h>
@@ -28,6 +30,7 @@
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
+#include <filesystem>
 #include <fstream>
 #include <memory>
 #include <sstream>
@@ -337,6 +340,85 @@ void printLatency(const Operation& op, const Stats& floor) {
                 a.median / floor.median, a.p99 / floor.p99);
 }
 
+// Puts every thread of `pid` (and the threads they start) on `cpus`.
+void setProcessAffinity(pid_t pid, const cpu_set_t& cpus) {
+    for (const auto& task : std::filesystem::directory_iterator("/proc/" + std::to_string(pid) +
+                                                               "/task")) {
+        sched_setaffinity(std::atoi(task.path().filename().c_str()), sizeof cpus, &cpus);
+    }
+}
+
+// Round trips of the echo floor and of the agent, alternating batches of each operation, under
+// one placement of the threads; prints the table.
+bool measureLatency(qax::test::AgentProcess& agent, std::vector<Operation> ops, int perRound,
+                    const char* placement, bool oneCore) {
+    cpu_set_t all, core0;
+    CPU_ZERO(&core0);
+    CPU_SET(0, &core0);
+    sched_getaffinity(0, sizeof all, &all);
+    if (oneCore) {
+        // This thread first: the echo server's threads start from it and keep its mask.
+        sched_setaffinity(0, sizeof core0, &core0);
+        setProcessAffinity(agent.pid(), core0);
+    }
+    bool ok = true;
+    {
+        EchoServer echoServer(agent.home() + "/echo.sock");
+        RawConnection echo(echoServer.path());
+        RawConnection toAgent(agent.socketPath());
+        if (!echo.ok() || !toAgent.ok()) {
+            std::fprintf(stderr, "cannot connect\n");
+            ok = false;
+        }
+        for (auto& op : ops) {
+            ok = ok && answers(toAgent, op.frame, op.name);
+        }
+        // Warm both paths, then alternate batches.
+        for (int i = 0; ok && i < perRound; ++i) {
+            echo.roundTrip(ops[0].frame);
+            toAgent.roundTrip(ops[0].frame);
+        }
+        for (int round = 0; ok && round < kRounds; ++round) {
+            for (auto& op : ops) {
+                for (int i = 0; i < perRound; ++i) {
+                    auto t = SteadyClock::now();
+                    echo.roundTrip(op.frame);
+                    op.echo.push_back(secondsSince(t));
+                }
+                for (int i = 0; ok && i < perRound; ++i) {
+                    auto t = SteadyClock::now();
+                    if (!toAgent.roundTrip(op.frame)) {
+                        std::fprintf(stderr, "%s: the connection closed\n", op.name);
+                        ok = false;
+                    }
+                    op.agent.push_back(secondsSince(t));
+                }
+            }
+        }
+    }
+    if (oneCore) {
+        sched_setaffinity(0, sizeof all, &all);
+        setProcessAffinity(agent.pid(), all);
+    }
+    if (!ok) {
+        return false;
+    }
+    std::vector<double> allEcho;
+    for (const auto& op : ops) {
+        allEcho.insert(allEcho.end(), op.echo.begin(), op.echo.end());
+    }
+    const Stats floor = stats(allEcho);
+    std::printf("round trip, %d calls each, %d alternating rounds, %s\n", perRound * kRounds,
+                kRounds, placement);
+    std::printf("  %-34s %8s %8s   %6s   %6s\n", "", "median", "p99", "x floor", "p99 x");
+    std::printf("  %-34s %8.1f %8.1f   (us)\n", "echo (floor)", floor.median * 1e6,
+                floor.p99 * 1e6);
+    for (const auto& op : ops) {
+        printLatency(op, floor);
+    }
+    return true;
+}
+
 struct Throughput {
     long requests = 0;
     double seconds = 0;
@@ -449,53 +531,14 @@ int main(int argc, char** argv) {
                     cpu.system / n * 1e6);
         return 0;
     }
-    {
-        EchoServer echoServer(agent->home() + "/echo.sock");
-        RawConnection echo(echoServer.path());
-        RawConnection toAgent(agent->socketPath());
-        if (!echo.ok() || !toAgent.ok()) {
-            std::fprintf(stderr, "cannot connect\n");
-            return 1;
-        }
-        for (auto& op : ops) {
-            if (!answers(toAgent, op.frame, op.name)) {
-                return 1;
-            }
-        }
-        // Warm both paths, then alternate batches.
-        for (int i = 0; i < perRound; ++i) {
-            echo.roundTrip(ops[0].frame);
-            toAgent.roundTrip(ops[0].frame);
-        }
-        for (int round = 0; round < kRounds; ++round) {
-            for (auto& op : ops) {
-                for (int i = 0; i < perRound; ++i) {
-                    auto t = SteadyClock::now();
-                    echo.roundTrip(op.frame);
-                    op.echo.push_back(secondsSince(t));
-                }
-                for (int i = 0; i < perRound; ++i) {
-                    auto t = SteadyClock::now();
-                    if (!toAgent.roundTrip(op.frame)) {
-                        std::fprintf(stderr, "%s: the connection closed\n", op.name);
-                        return 1;
-                    }
-                    op.agent.push_back(secondsSince(t));
-                }
-            }
-        }
-    }
-    std::vector<double> allEcho;
-    for (const auto& op : ops) {
-        allEcho.insert(allEcho.end(), op.echo.begin(), op.echo.end());
-    }
-    const Stats floor = stats(allEcho);
-    std::printf("round trip, %d calls each, %d alternating rounds\n", perRound * kRounds, kRounds);
-    std::printf("  %-34s %8s %8s   %6s   %6s\n", "", "median", "p99", "x floor", "p99 x");
-    std::printf("  %-34s %8.1f %8.1f   (us)\n", "echo (floor)", floor.median * 1e6,
-                floor.p99 * 1e6);
-    for (const auto& op : ops) {
-        printLatency(op, floor);
+    // Where the scheduler puts the client, the echo server and the agent decides much of a
+    // round trip here: a wake-up on the other core costs several times the work of a small
+    // request. The scheduler's own choice varies from run to run (and may favour one side),
+    // so the latencies are also measured with all three on one core, where both sides pay
+    // the same switches and the ratio shows the agent's own work.
+    if (!measureLatency(*agent, ops, perRound, "scheduler's choice of cores", false) ||
+        !measureLatency(*agent, ops, perRound, "client, echo server and agent on core 0", true)) {
+        return 1;
     }
 
     {
