@@ -11,7 +11,7 @@
 
 namespace qax {
 
-std::optional<Value> CachedPlistFile::read(bool* present) {
+std::shared_ptr<const Value> CachedPlistFile::read(bool* present) {
     const std::uint64_t scope = FileSnapshotScope::current();
     if (scope != 0) {
         std::lock_guard lock(mutex_);
@@ -51,7 +51,9 @@ std::optional<Value> CachedPlistFile::read(bool* present) {
     auto bytes = readWholeFile(path_, kMaxPlistBytes);
     std::string error;
     if (bytes) {
-        value_ = parsePlist(*bytes, &error);
+        if (auto parsed = parsePlist(*bytes, &error)) {
+            value_ = std::make_shared<const Value>(std::move(*parsed));
+        }
     }
     if (!value_) {
         qaxLog().error("Ignoring unreadable platform file '%@': %@", path_,

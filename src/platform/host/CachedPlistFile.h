@@ -1,12 +1,14 @@
 // A property-list file of the platform root (device.plist, features.plist, ...), parsed
 // once per change: the file is re-read only when its identity or modification time
 // changes, and the file on disk stays the truth. A missing or malformed file reads as
-// none. Within a FileSnapshotScope the file is looked at once. Thread-safe.
+// none. Within a FileSnapshotScope the file is looked at once. Readers share the parsed
+// content (it is never changed in place), so a read copies nothing. Thread-safe.
 #pragma once
 
 #include <sys/types.h>
 
 #include <cstdint>
+#include <memory>
 #include <mutex>
 #include <optional>
 #include <string>
@@ -21,7 +23,7 @@ class CachedPlistFile {
 
     // `present`, when given, says whether the file is there, or cannot be looked at for
     // another reason than its absence (an unreadable file is not a missing one).
-    std::optional<Value> read(bool* present = nullptr);
+    std::shared_ptr<const Value> read(bool* present = nullptr);
     const std::string& path() const { return path_; }
 
   private:
@@ -33,7 +35,7 @@ class CachedPlistFile {
     off_t size_ = -1;
     long long mtimeNs_ = -1;
     bool present_ = false;
-    std::optional<Value> value_;
+    std::shared_ptr<const Value> value_;
     // The FileSnapshotScope in which the file was last looked at.
     std::uint64_t checkedInScope_ = 0;
 };
