@@ -15,6 +15,7 @@
 
 #include "core/AtomicFile.h"
 #include "core/Clock.h"
+#include "core/FileChangeMonitor.h"
 #include "core/Hash.h"
 #include "core/Log.h"
 #include "core/PlistCodec.h"
@@ -53,13 +54,24 @@ std::string pathForSerialNumber(const Platform& platform,
                         sha256Hash(*serialNumber));
 }
 
-// Parsed cache files by path. Few devices are ever cached, so the table stays small; past the
-// bound it starts again.
+// Parsed cache files by path, looked at again only once their directory has seen a change
+// (FileChangeMonitor), then compared by identity. Few devices are ever cached, so the table
+// stays small; past the bound it starts again.
 class ParsedFiles {
   public:
     // The file's root dictionary; none for a missing, unreadable or malformed file or any
     // other root.
     std::optional<Value> read(const std::string& path) {
+        FileChangeMonitor& monitor = FileChangeMonitor::shared();
+        {
+            // Nothing has changed in the file's directory since it was parsed.
+            std::lock_guard lock(mutex_);
+            if (auto it = files_.find(path);
+                it != files_.end() && monitor.holds(path, it->second.stamp)) {
+                return it->second.value;
+            }
+        }
+        const std::uint64_t stamp = monitor.stamp(path);
         struct stat st {};
         if (::stat(path.c_str(), &st) != 0) {
             forget(path);
@@ -70,6 +82,7 @@ class ParsedFiles {
             std::lock_guard lock(mutex_);
             if (auto it = files_.find(path);
                 it != files_.end() && it->second.settled && it->second.identity == identity) {
+                it->second.stamp = stamp;
                 return it->second.value;
             }
         }
@@ -91,7 +104,9 @@ class ParsedFiles {
         // change again without its times moving, so it is parsed again until it is older.
         const bool settled = readNs - identity.modifiedNs > kTimeGranularityNs &&
                              readNs - identity.changedNs > kTimeGranularityNs;
-        files_.insert_or_assign(path, Parsed{identity, settled, value});
+        // Notices tell apart changes that file times cannot: with a stamp, an unsettled file is
+        // not read again while nothing changes.
+        files_.insert_or_assign(path, Parsed{identity, settled, stamp, value});
         return value;
     }
 
@@ -113,6 +128,7 @@ class ParsedFiles {
     struct Parsed {
         Identity identity;
         bool settled = false;
+        std::uint64_t stamp = 0;  // the directory's, taken before the file was looked at
         std::optional<Value> value;
     };
     static constexpr std::size_t kMaxFiles = 64;

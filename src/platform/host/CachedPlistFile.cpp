@@ -5,6 +5,7 @@
 #include <cerrno>
 
 #include "core/AtomicFile.h"
+#include "core/FileChangeMonitor.h"
 #include "core/FileSnapshotScope.h"
 #include "core/Log.h"
 #include "core/PlistCodec.h"
@@ -13,15 +14,19 @@ namespace qax {
 
 std::shared_ptr<const Value> CachedPlistFile::read(bool* present) {
     const std::uint64_t scope = FileSnapshotScope::current();
-    if (scope != 0) {
+    FileChangeMonitor& monitor = FileChangeMonitor::shared();
+    {
         std::lock_guard lock(mutex_);
-        if (loaded_ && scope == checkedInScope_) {
+        // Looked at already during this piece of work, or nothing has changed since.
+        if (loaded_ && ((scope != 0 && scope == checkedInScope_) || monitor.holds(path_, stamp_))) {
+            checkedInScope_ = scope;
             if (present) {
                 *present = present_;
             }
-            return value_;  // looked at already during this piece of work
+            return value_;
         }
     }
+    const std::uint64_t stamp = monitor.stamp(path_);
     struct stat st {};
     const bool exists = ::stat(path_.c_str(), &st) == 0;
     const bool there = exists || (errno != ENOENT && errno != ENOTDIR);
@@ -34,6 +39,7 @@ std::shared_ptr<const Value> CachedPlistFile::read(bool* present) {
     std::lock_guard lock(mutex_);
     checkedInScope_ = scope;
     present_ = there;
+    stamp_ = stamp;
     if (loaded_ && (exists ? (st.st_dev == dev_ && st.st_ino == ino_ && st.st_size == size_ &&
                               mtimeNs == mtimeNs_)
                            : size_ == -1)) {

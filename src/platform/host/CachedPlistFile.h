@@ -1,7 +1,8 @@
 // A property-list file of the platform root (device.plist, features.plist, ...), parsed
 // once per change: the file is re-read only when its identity or modification time
 // changes, and the file on disk stays the truth. A missing or malformed file reads as
-// none. Within a FileSnapshotScope the file is looked at once. Readers share the parsed
+// none. Within a FileSnapshotScope the file is looked at once, and not at all while its
+// directory has seen no change (FileChangeMonitor). Readers share the parsed
 // content (it is never changed in place), so a read copies nothing. Thread-safe.
 #pragma once
 
@@ -35,6 +36,8 @@ class CachedPlistFile {
     off_t size_ = -1;
     long long mtimeNs_ = -1;
     bool present_ = false;
+    // The directory's stamp taken before the file was last looked at.
+    std::uint64_t stamp_ = 0;
     std::shared_ptr<const Value> value_;
     // The FileSnapshotScope in which the file was last looked at.
     std::uint64_t checkedInScope_ = 0;

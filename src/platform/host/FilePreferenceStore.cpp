@@ -8,6 +8,7 @@
 #include <filesystem>
 
 #include "core/AtomicFile.h"
+#include "core/FileChangeMonitor.h"
 #include "core/FileSnapshotScope.h"
 #include "core/Log.h"
 #include "core/PlistCodec.h"
@@ -93,10 +94,14 @@ Value::Dictionary FilePreferenceStore::loadLocked(const FileIdentity& identity) 
 
 void FilePreferenceStore::refreshLocked() {
     const std::uint64_t scope = FileSnapshotScope::current();
-    if (loadedOnce_ && scope != 0 && scope == checkedInScope_) {
-        return;  // looked at already during this piece of work
+    FileChangeMonitor& monitor = FileChangeMonitor::shared();
+    // Looked at already during this piece of work, or nothing has changed since.
+    if (loadedOnce_ && ((scope != 0 && scope == checkedInScope_) || monitor.holds(path_, stamp_))) {
+        checkedInScope_ = scope;
+        return;
     }
     checkedInScope_ = scope;
+    stamp_ = monitor.stamp(path_);
     FileIdentity id = currentIdentity();
     if (loadedOnce_ && id == loaded_) {
         return;

@@ -72,6 +72,8 @@ class FilePreferenceStore : public PreferenceStore {
     bool loadedOnce_ = false;
     // The FileSnapshotScope in which the file was last looked at.
     std::uint64_t checkedInScope_ = 0;
+    // The directory's stamp taken before the file was last looked at (FileChangeMonitor).
+    std::uint64_t stamp_ = 0;
 };
 
 }  // namespace qax
