@@ -1,5 +1,6 @@
 #include "warranty/QAXWarranty.h"
 
+#include <algorithm>
 #include <cmath>
 #include <iterator>
 #include <limits>
@@ -36,6 +37,20 @@ Value withoutNulls(Value value) {
         }
     }
     return value;
+}
+
+bool containsNull(const Value& value) {
+    if (value.isNull()) {
+        return true;
+    }
+    if (const auto* dictionary = value.asDictionary()) {
+        return std::any_of(dictionary->begin(), dictionary->end(),
+                           [](const auto& entry) { return containsNull(entry.second); });
+    }
+    if (const auto* array = value.asArray()) {
+        return std::any_of(array->begin(), array->end(), containsNull);
+    }
+    return false;
 }
 
 // Containers of the coverage summary.
@@ -288,14 +303,34 @@ std::shared_ptr<QAXWarranty> QAXWarranty::initWithDictionary(
     if (!dictionary || !dictionary->isDictionary()) {
         return nullptr;
     }
-    return std::make_shared<QAXWarranty>(std::move(platform), std::move(*dictionary),
-                                         serialNumber);
+    return std::make_shared<QAXWarranty>(std::move(platform), std::move(*dictionary), serialNumber);
+}
+
+std::shared_ptr<QAXWarranty> QAXWarranty::warrantyWithSharedDictionary(
+    std::shared_ptr<Platform> platform, std::shared_ptr<const Value> dictionary) {
+    static constexpr const char* kOperation = "+[QAXWarranty warrantyWithDictionary:serialNumber:]";
+    std::shared_ptr<QAXWarranty> warranty;
+    if (dictionary && dictionary->isDictionary()) {
+        warranty = std::make_shared<QAXWarranty>(std::move(platform), std::move(dictionary));
+    }
+    qaxLog().info("%s : %d", kOperation, warranty ? 1 : 0);
+    return warranty;
 }
 
 QAXWarranty::QAXWarranty(std::shared_ptr<Platform> platform, Value dictionary,
+                         const std::optional<std::string>& serialNumber)
+    : QAXWarranty(std::move(platform),
+                  std::make_shared<const Value>(withoutNulls(std::move(dictionary))),
+                  serialNumber) {}
+
+QAXWarranty::QAXWarranty(std::shared_ptr<Platform> platform,
+                         std::shared_ptr<const Value> dictionary,
                          const std::optional<std::string>& /*serialNumber*/)
-    : platform_(std::move(platform)), dictionary_(withoutNulls(std::move(dictionary))) {
-    const Value& d = dictionary_;
+    : platform_(std::move(platform)),
+      dictionary_(containsNull(*dictionary)
+                      ? std::make_shared<const Value>(withoutNulls(Value(*dictionary)))
+                      : std::move(dictionary)) {
+    const Value& d = *dictionary_;
     auto top = [&d](const char* key) { return d.find(key); };
     auto toggles = [&d](const char* key) { return nested(d, kFeatureToggleParameters, key); };
     auto coverage = [&d](const char* key) { return nested(d, kCoverage, key); };
@@ -473,20 +508,20 @@ std::optional<std::string> QAXWarranty::hvLocalizedOfferDetailsEligibility() con
 }
 
 std::string QAXWarranty::description() const {
-    return dictionary_.description();
+    return dictionary_->description();
 }
 
 bool QAXWarranty::isEqual(const QAXWarranty* other) const {
     if (other == this) {
         return true;
     }
-    return other && dictionary_ == other->dictionary_;
+    return other && *dictionary_ == *other->dictionary_;
 }
 
 Value QAXWarranty::encode() const {
     Value archive{Value::Dictionary{}};
     archive[kArchiveClassKey] = kArchiveClassName;
-    archive[kArchiveDictionaryKey] = dictionary_;
+    archive[kArchiveDictionaryKey] = *dictionary_;
     return archive;
 }
 

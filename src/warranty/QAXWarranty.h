@@ -34,6 +34,14 @@ class QAXWarranty {
     // conversion-date override, the day length), the clock and the locale.
     QAXWarranty(std::shared_ptr<Platform> platform, Value dictionary,
                 const std::optional<std::string>& serialNumber = std::nullopt);
+    // The same from a tree shared with its reader (a parsed cache file): the record keeps the
+    // tree as it is (it never changes it), copying it only if it holds nulls to drop.
+    QAXWarranty(std::shared_ptr<Platform> platform, std::shared_ptr<const Value> dictionary,
+                const std::optional<std::string>& serialNumber = std::nullopt);
+    // warrantyWithDictionary for such a tree: the same log line, none for a missing tree or
+    // one that is not a dictionary.
+    static std::shared_ptr<QAXWarranty> warrantyWithSharedDictionary(
+        std::shared_ptr<Platform> platform, std::shared_ptr<const Value> dictionary);
 
     QAXWarranty(const QAXWarranty&) = delete;
     QAXWarranty& operator=(const QAXWarranty&) = delete;
@@ -185,7 +193,7 @@ class QAXWarranty {
     std::optional<Value> supportAppURL() const { return get(&Fields::supportAppURL); }
     // The whole summary the record was built from: what is cached, archived, compared and
     // printed.
-    const Value& dictionaryRepresentation() const { return dictionary_; }
+    const Value& dictionaryRepresentation() const { return *dictionary_; }
     std::optional<std::string> serialNumber() const { return get(&Fields::serialNumber); }
     bool showNotificationToggle() const { return get(&Fields::showNotificationToggle); }
     double showNotificationBeforeEndDate() const {
@@ -468,7 +476,7 @@ class QAXWarranty {
                                          const char* notAStringMessage) const;
 
     const std::shared_ptr<Platform> platform_;
-    const Value dictionary_;
+    const std::shared_ptr<const Value> dictionary_;
     mutable std::mutex mutex_;
     Fields fields_;
 };

@@ -61,7 +61,7 @@ class ParsedFiles {
   public:
     // The file's root dictionary; none for a missing, unreadable or malformed file or any
     // other root.
-    std::optional<Value> read(const std::string& path) {
+    std::shared_ptr<const Value> read(const std::string& path) {
         FileChangeMonitor& monitor = FileChangeMonitor::shared();
         {
             // Nothing has changed in the file's directory since it was parsed.
@@ -75,7 +75,7 @@ class ParsedFiles {
         struct stat st {};
         if (::stat(path.c_str(), &st) != 0) {
             forget(path);
-            return std::nullopt;
+            return nullptr;
         }
         const Identity identity = identityOf(st);
         {
@@ -89,11 +89,10 @@ class ParsedFiles {
         // Read after the stat: a file replaced in between is newer than the identity kept
         // with it, so the next stat sees the change and reads it again.
         const long long readNs = fileSystemTimeNs();
-        std::optional<Value> value;
+        std::shared_ptr<const Value> value;
         if (auto bytes = readWholeFile(path, kMaxPlistBytes)) {
-            value = parsePlist(*bytes);
-            if (value && !value->isDictionary()) {
-                value.reset();
+            if (auto parsed = parsePlist(*bytes); parsed && parsed->isDictionary()) {
+                value = std::make_shared<const Value>(std::move(*parsed));
             }
         }
         std::lock_guard lock(mutex_);
@@ -128,8 +127,8 @@ class ParsedFiles {
     struct Parsed {
         Identity identity;
         bool settled = false;
-        std::uint64_t stamp = 0;  // the directory's, taken before the file was looked at
-        std::optional<Value> value;
+        std::uint64_t stamp = 0;             // the directory's, taken before the file was looked at
+        std::shared_ptr<const Value> value;  // shared with the records built from it
     };
     static constexpr std::size_t kMaxFiles = 64;
     // Coarser than any file system's timestamp tick.
@@ -149,7 +148,7 @@ ParsedFiles& parsedFiles() {
     return files;
 }
 
-std::optional<Value> readDictionary(const std::string& path) {
+std::shared_ptr<const Value> readDictionary(const std::string& path) {
     return parsedFiles().read(path);
 }
 
@@ -187,13 +186,13 @@ std::shared_ptr<QAXWarranty> QAXWarranty::cachedWarrantyForSerialNumber(
     std::shared_ptr<Platform> platform, const std::optional<std::string>& serialNumber) {
     const std::string path = pathForSerialNumber(*platform, serialNumber);
     qaxLog().info("%s : warrantyPath : %@", "+[QAXWarranty cachedWarrantyForSerialNumber:]", path);
-    return warrantyWithDictionary(std::move(platform), readDictionary(path));
+    return warrantyWithSharedDictionary(std::move(platform), readDictionary(path));
 }
 
 std::shared_ptr<QAXWarranty> QAXWarranty::migrateLegacyCachedWarrantyIfNeededForSerialNumber(
     std::shared_ptr<Platform> platform, const std::string& serialNumber) {
     const std::string legacyPath = _legacyWarrantyPath(*platform);
-    auto warranty = warrantyWithDictionary(platform, readDictionary(legacyPath));
+    auto warranty = warrantyWithSharedDictionary(platform, readDictionary(legacyPath));
     if (!warranty) {
         return nullptr;
     }
