@@ -355,6 +355,128 @@ std::optional<Value> fromPlist(plist_t node) {
     }
 }
 
+// The common kind of binary property list, read without the library: arrays, dictionaries
+// with text keys, integers of up to 8 bytes, booleans and ASCII text without NUL characters:
+// what the agent's clients send, so a request costs no library tree. Only for a document
+// binaryStructureIsSafe() accepted (its offsets, references and depth are checked there).
+// Anything else is left to the library (none), which reads these kinds the same way.
+class SimpleBinaryPlistReader {
+  public:
+    explicit SimpleBinaryPlistReader(std::string_view s)
+        : data_(reinterpret_cast<const unsigned char*>(s.data())) {
+        const unsigned char* trailer = data_ + s.size() - 32;
+        offsetSize_ = trailer[6];
+        refSize_ = trailer[7];
+        numObjects_ = readBigEndian(trailer + 8, 8);
+        topObject_ = readBigEndian(trailer + 16, 8);
+        tableOffset_ = readBigEndian(trailer + 24, 8);
+    }
+
+    std::optional<Value> read() { return object(topObject_, 1); }
+
+  private:
+    std::optional<Value> object(std::uint64_t index, int depth) {
+        if (index >= numObjects_ || depth > kMaxValueDepth + 1) {
+            return std::nullopt;
+        }
+        const std::uint64_t off =
+            readBigEndian(data_ + tableOffset_ + index * offsetSize_, offsetSize_);
+        if (off < 8 || off >= tableOffset_) {
+            return std::nullopt;
+        }
+        const unsigned marker = data_[off];
+        switch (marker >> 4) {
+            case 0x0:
+                if (marker == 0x08 || marker == 0x09) {
+                    return Value(marker == 0x09);
+                }
+                return std::nullopt;
+            case 0x1: {
+                const std::size_t n = std::size_t{1} << (marker & 0xF);
+                if (n > 8 || off + 1 + n > tableOffset_) {
+                    return std::nullopt;
+                }
+                return Value(static_cast<long long>(readBigEndian(data_ + off + 1, n)));
+            }
+            case 0x5: {
+                std::uint64_t count = 0, pos = 0;
+                if (!length(off, count, pos) || count > tableOffset_ - pos) {
+                    return std::nullopt;
+                }
+                const auto* text = reinterpret_cast<const char*>(data_ + pos);
+                if (!std::all_of(text, text + count,
+                                 [](unsigned char c) { return c >= 0x01 && c <= 0x7F; })) {
+                    return std::nullopt;
+                }
+                return Value(std::string(text, count));
+            }
+            case 0xA:
+            case 0xD: {
+                const bool isDictionary = (marker >> 4) == 0xD;
+                std::uint64_t count = 0, pos = 0;
+                if (!length(off, count, pos)) {
+                    return std::nullopt;
+                }
+                const std::uint64_t refs = isDictionary ? count * 2 : count;
+                if (count > tableOffset_ || refs > (tableOffset_ - pos) / refSize_) {
+                    return std::nullopt;
+                }
+                auto ref = [&](std::uint64_t k) {
+                    return readBigEndian(data_ + pos + k * refSize_, refSize_);
+                };
+                if (!isDictionary) {
+                    Value::Array array;
+                    array.reserve(count);
+                    for (std::uint64_t k = 0; k < count; ++k) {
+                        auto element = object(ref(k), depth + 1);
+                        if (!element) {
+                            return std::nullopt;
+                        }
+                        array.push_back(std::move(*element));
+                    }
+                    return Value(std::move(array));
+                }
+                Value::Dictionary dictionary;
+                for (std::uint64_t k = 0; k < count; ++k) {
+                    auto key = object(ref(k), depth + 1);
+                    auto element = object(ref(count + k), depth + 1);
+                    if (!key || !key->isString() || !element) {
+                        return std::nullopt;
+                    }
+                    dictionary.insert_or_assign(std::move(*key->asString()), std::move(*element));
+                }
+                return Value(std::move(dictionary));
+            }
+            default:
+                return std::nullopt;
+        }
+    }
+
+    // The element count of the object at `off` (from its marker, or the integer after it) and
+    // where its content starts.
+    bool length(std::uint64_t off, std::uint64_t& count, std::uint64_t& pos) const {
+        count = data_[off] & 0xF;
+        pos = off + 1;
+        if (count != 0xF) {
+            return true;
+        }
+        if (pos >= tableOffset_ || (data_[pos] >> 4) != 0x1) {
+            return false;
+        }
+        const std::size_t n = std::size_t{1} << (data_[pos] & 0xF);
+        if (n > 8 || pos + 1 + n > tableOffset_) {
+            return false;
+        }
+        count = readBigEndian(data_ + pos + 1, n);
+        pos += 1 + n;
+        return true;
+    }
+
+    const unsigned char* data_;
+    std::size_t offsetSize_ = 0, refSize_ = 0;
+    std::uint64_t numObjects_ = 0, topObject_ = 0, tableOffset_ = 0;
+};
+
 plist_t toPlist(const Value& v) {
     switch (v.kind()) {
         case Value::Kind::Null:
@@ -435,6 +557,18 @@ bool plistStructureIsSafe(std::string_view bytes, std::string* error) {
 }
 
 std::optional<Value> parsePlist(std::string_view bytes, std::string* error) {
+    if (!plistStructureIsSafe(bytes, error)) {
+        return std::nullopt;
+    }
+    if (isBinaryPlist(bytes)) {
+        if (auto simple = SimpleBinaryPlistReader(bytes).read()) {
+            return simple;
+        }
+    }
+    return parsePlistWithLibrary(bytes, error);
+}
+
+std::optional<Value> parsePlistWithLibrary(std::string_view bytes, std::string* error) {
     if (!plistStructureIsSafe(bytes, error)) {
         return std::nullopt;
     }

@@ -15,8 +15,11 @@ namespace qax {
 inline constexpr std::size_t kMaxPlistBytes = 16 * 1024 * 1024;
 
 // Parses an XML or binary property list. On failure returns no value and, when `error` is
-// given, a reason.
+// given, a reason. Binary lists of the plain kinds clients send (containers, integers,
+// booleans, ASCII text) are read directly; everything else goes through the library.
 std::optional<Value> parsePlist(std::string_view bytes, std::string* error = nullptr);
+// The same, always through the library: what the direct reading must agree with.
+std::optional<Value> parsePlistWithLibrary(std::string_view bytes, std::string* error = nullptr);
 
 // Serialises a tree. No value when the tree holds something a property list cannot
 // represent: a null anywhere, or a date outside the range the format stores.

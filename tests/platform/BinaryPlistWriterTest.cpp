@@ -64,7 +64,37 @@ TEST(BinaryPlistWriterTest, ReadsBackAsTheGeneralCodecsDocument) {
         const auto theirs = toBinaryPlist(v);
         ASSERT_TRUE(ours && theirs) << v.description().substr(0, 80);
         EXPECT_EQ(parsePlist(*ours), parsePlist(*theirs)) << v.description().substr(0, 80);
+        // Plain documents are read without the library: the same values either way.
+        EXPECT_EQ(parsePlist(*ours), parsePlistWithLibrary(*ours)) << v.description().substr(0, 80);
     }
+}
+
+// Damaged documents too: every byte of a request changed in several ways, and the direct
+// reading answers as the library does (the same value, or none).
+TEST(BinaryPlistWriterTest, DirectReadingAgreesWithTheLibraryOnDamagedDocuments) {
+    const Value requests[] = {
+        Value(Value::Dictionary{
+            {"id", Value(1)}, {"op", "defaultDevice:"}, {"args", Value::Array{}}}),
+        Value(Value::Dictionary{{"id", Value(300)},
+                                {"op", "getAllDeviceInfosUsingPolicy:updateFollowUps:withReply:"},
+                                {"args", Value::Array{Value(2), Value(true), Value("C02SERIAL")}}}),
+        arrayOf(20),
+    };
+    int compared = 0;
+    for (const Value& request : requests) {
+        const auto bytes = BinaryPlistWriter::write(request);
+        ASSERT_TRUE(bytes);
+        for (std::size_t at = 0; at < bytes->size(); ++at) {
+            for (const unsigned char change : {0x01, 0x0F, 0x10, 0x80, 0xFF}) {
+                std::string damaged = *bytes;
+                damaged[at] = static_cast<char>(static_cast<unsigned char>(damaged[at]) ^ change);
+                EXPECT_EQ(parsePlist(damaged), parsePlistWithLibrary(damaged))
+                    << "byte " << at << " ^ " << int(change);
+                ++compared;
+            }
+        }
+    }
+    EXPECT_GT(compared, 1000);
 }
 
 TEST(BinaryPlistWriterTest, RefusesWhatHasNoPropertyListForm) {
