@@ -1,7 +1,8 @@
 #include "core/IcuLibrary.h"
 
-#include <dlfcn.h>
 #include <unicode/uvernum.h>
+
+#include "core/DynamicLibrary.h"
 
 namespace qax {
 namespace {
@@ -20,37 +21,23 @@ struct Loaded {
     std::string error;
 };
 
-void* open(const char* name, std::string& error) {
-    // Kept for the life of the process: formatters made by it may live as long.
-    void* handle = dlopen(name, RTLD_NOW | RTLD_LOCAL);
-    if (!handle && error.empty()) {
-        const char* reason = dlerror();
-        error = std::string("cannot load ") + name + ": " + (reason ? reason : "");
-    }
-    return handle;
-}
-
-template <typename F>
-bool resolve(void* handle, const char* name, F& out, std::string& error) {
-    out = handle ? reinterpret_cast<F>(dlsym(handle, name)) : nullptr;
-    if (!out && error.empty()) {
-        error = std::string("ICU has no ") + name;
-    }
-    return out != nullptr;
-}
-
 Loaded load() {
     Loaded loaded;
     std::string& e = loaded.error;
-    void* common = open(kCommonLibrary, e);
-    void* formatting = open(kFormattingLibrary, e);
+    void* common = openLibrary(kCommonLibrary, e);
+    void* formatting = openLibrary(kFormattingLibrary, e);
     IcuLibrary& f = loaded.functions;
-    bool ok = resolve(common, QAX_ICU_SYMBOL(u_strFromUTF8), f.strFromUTF8, e);
-    ok &= resolve(common, QAX_ICU_SYMBOL(u_strFromUTF8WithSub), f.strFromUTF8WithSub, e);
-    ok &= resolve(common, QAX_ICU_SYMBOL(u_strToUTF8), f.strToUTF8, e);
-    ok &= resolve(formatting, QAX_ICU_SYMBOL(unum_open), f.numberFormatOpen, e);
-    ok &= resolve(formatting, QAX_ICU_SYMBOL(unum_formatInt64), f.numberFormatInt64, e);
-    ok &= resolve(formatting, QAX_ICU_SYMBOL(unum_close), f.numberFormatClose, e);
+    bool ok =
+        resolveFunction(common, kCommonLibrary, QAX_ICU_SYMBOL(u_strFromUTF8), f.strFromUTF8, e);
+    ok &= resolveFunction(common, kCommonLibrary, QAX_ICU_SYMBOL(u_strFromUTF8WithSub),
+                          f.strFromUTF8WithSub, e);
+    ok &= resolveFunction(common, kCommonLibrary, QAX_ICU_SYMBOL(u_strToUTF8), f.strToUTF8, e);
+    ok &= resolveFunction(formatting, kFormattingLibrary, QAX_ICU_SYMBOL(unum_open),
+                          f.numberFormatOpen, e);
+    ok &= resolveFunction(formatting, kFormattingLibrary, QAX_ICU_SYMBOL(unum_formatInt64),
+                          f.numberFormatInt64, e);
+    ok &= resolveFunction(formatting, kFormattingLibrary, QAX_ICU_SYMBOL(unum_close),
+                          f.numberFormatClose, e);
     loaded.ok = ok;
     return loaded;
 }

@@ -82,6 +82,27 @@ std::uint64_t readBigEndian(const unsigned char* p, std::size_t n) {
     return v;
 }
 
+// The element count of the binary object at `off` (from its marker, or the integer after it)
+// and where its content starts; false when the count's integer lies past `end`.
+bool binaryObjectLength(const unsigned char* data, std::uint64_t end, std::uint64_t off,
+                        std::uint64_t& count, std::uint64_t& pos) {
+    count = data[off] & 0xF;
+    pos = off + 1;
+    if (count != 0xF) {
+        return true;
+    }
+    if (pos >= end || (data[pos] >> 4) != 0x1) {
+        return false;
+    }
+    const std::size_t n = std::size_t{1} << (data[pos] & 0xF);
+    if (n > 8 || pos + 1 + n > end) {
+        return false;
+    }
+    count = readBigEndian(data + pos + 1, n);
+    pos += 1 + n;
+    return true;
+}
+
 // Walks the object graph of a binary property list from its top object, checking every
 // offset and reference, and refusing deep nesting (which also catches reference cycles)
 // and graphs that expand to too many nodes through shared references.
@@ -108,24 +129,8 @@ bool binaryStructureIsSafe(std::string_view s, std::string* error) {
         out = readBigEndian(data + tableOffset + index * offsetSize, offsetSize);
         return out >= 8 && out < tableOffset;
     };
-    // The element count of the object at `off` (from its marker, or the integer after it) and
-    // where its content starts.
     auto objectLength = [&](std::uint64_t off, std::uint64_t& count, std::uint64_t& pos) {
-        count = data[off] & 0xF;
-        pos = off + 1;
-        if (count != 0xF) {
-            return true;
-        }
-        if (pos >= tableOffset || (data[pos] >> 4) != 0x1) {
-            return false;
-        }
-        const std::size_t n = std::size_t{1} << (data[pos] & 0xF);
-        if (n > 8 || pos + 1 + n > tableOffset) {
-            return false;
-        }
-        count = readBigEndian(data + pos + 1, n);
-        pos += 1 + n;
-        return true;
+        return binaryObjectLength(data, tableOffset, off, count, pos);
     };
     // An ASCII or UTF-16 string inside the object area, without a NUL character.
     auto isPlainKey = [&](std::uint64_t index) {
@@ -452,24 +457,8 @@ class SimpleBinaryPlistReader {
         }
     }
 
-    // The element count of the object at `off` (from its marker, or the integer after it) and
-    // where its content starts.
     bool length(std::uint64_t off, std::uint64_t& count, std::uint64_t& pos) const {
-        count = data_[off] & 0xF;
-        pos = off + 1;
-        if (count != 0xF) {
-            return true;
-        }
-        if (pos >= tableOffset_ || (data_[pos] >> 4) != 0x1) {
-            return false;
-        }
-        const std::size_t n = std::size_t{1} << (data_[pos] & 0xF);
-        if (n > 8 || pos + 1 + n > tableOffset_) {
-            return false;
-        }
-        count = readBigEndian(data_ + pos + 1, n);
-        pos += 1 + n;
-        return true;
+        return binaryObjectLength(data_, tableOffset_, off, count, pos);
     }
 
     const unsigned char* data_;
