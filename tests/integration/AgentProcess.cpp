@@ -19,6 +19,24 @@ void AgentProcess::writeRootFile(const std::string& relativePath, const Value& p
     writeFile(std::filesystem::path(platformRoot()) / relativePath, toXmlPlist(plist).value());
 }
 
+void AgentProcess::writeDevices(const std::string& serialNumber,
+                                const std::optional<std::string>& watchSerialNumber) {
+    writeRootFile("device.plist", Value::Dictionary{{"SerialNumber", serialNumber},
+                                                    {"ProductType", "Phone1,1"},
+                                                    {"ProductVersion", "1.0"}});
+    if (!watchSerialNumber) {
+        return;
+    }
+    writeRootFile("paired-devices.plist",
+                  Value::Array{Value::Dictionary{{"name", "Watch"},
+                                                 {"serialNumber", *watchSerialNumber},
+                                                 {"pairedDate", Date(1700000000)},
+                                                 {"isPaired", true},
+                                                 {"isArchived", false}}});
+    writeRootFile("features.plist",
+                  Value::Dictionary{{"Kestova", Value::Dictionary{{"Tessel_3_0", true}}}});
+}
+
 void AgentProcess::registerApplication(const std::string& name, const std::string& executablePath,
                                        std::optional<std::string> bundleIdentifier,
                                        std::optional<Value> entitlement) {

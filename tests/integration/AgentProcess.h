@@ -29,6 +29,10 @@ class AgentProcess {
 
     // Writes a file under the platform root ("device.plist", "apps/x.plist").
     void writeRootFile(const std::string& relativePath, const Value& plist);
+    // This device (a phone with `serialNumber`) and, when given, one paired watch, with the
+    // paired-watches feature on.
+    void writeDevices(const std::string& serialNumber,
+                      const std::optional<std::string>& watchSerialNumber = std::nullopt);
     // Registers an executable in the application registry under `name`; an entitlement value of
     // none leaves the entitlement out.
     void registerApplication(const std::string& name, const std::string& executablePath,

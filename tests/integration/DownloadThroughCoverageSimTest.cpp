@@ -47,17 +47,7 @@ TEST(DownloadThroughCoverageSim, PreviewedRequestsThenForcedDownloadThenCachedAn
     auto ctl = [&](const std::vector<std::string>& args) {
         return test::runTool(QAX_CTL_BINARY, args, agent.environment());
     };
-    agent.writeRootFile("device.plist", Value::Dictionary{{"SerialNumber", kPhone},
-                                                          {"ProductType", "Phone1,1"},
-                                                          {"ProductVersion", "1.0"}});
-    agent.writeRootFile("paired-devices.plist",
-                        Value::Array{Value::Dictionary{{"name", "Watch"},
-                                                       {"serialNumber", kWatch},
-                                                       {"pairedDate", Date(1700000000)},
-                                                       {"isPaired", true},
-                                                       {"isArchived", false}}});
-    agent.writeRootFile("features.plist",
-                        Value::Dictionary{{"Kestova", Value::Dictionary{{"Tessel_3_0", true}}}});
+    agent.writeDevices(kPhone, kWatch);
     auto refused = ctl({"request-preview", kPhone, "--json"});
     EXPECT_EQ(refused.status, 1);
     EXPECT_TRUE(refused.out.empty()) << refused.out;

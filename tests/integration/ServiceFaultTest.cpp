@@ -111,18 +111,7 @@ class ServiceFaultTest : public ::testing::Test {
         const std::string root = agent.platformRoot();
         sim = std::make_unique<test::CoverageSimProcess>(agent.home() + "/sim", root);
         ASSERT_FALSE(sim->base().empty()) << "coverage-sim did not start";
-        agent.writeRootFile("device.plist", Value::Dictionary{{"SerialNumber", kPhone},
-                                                              {"ProductType", "Phone1,1"},
-                                                              {"ProductVersion", "1.0"}});
-        agent.writeRootFile("paired-devices.plist",
-                            Value::Array{Value::Dictionary{{"name", "Watch"},
-                                                           {"serialNumber", kWatch},
-                                                           {"pairedDate", Date(1700000000)},
-                                                           {"isPaired", true},
-                                                           {"isArchived", false}}});
-        agent.writeRootFile(
-            "features.plist",
-            Value::Dictionary{{"Kestova", Value::Dictionary{{"Tessel_3_0", true}}}});
+        agent.writeDevices(kPhone, kWatch);
         agent.writeRootFile(
             "accounts.plist",
             Value::Dictionary{
@@ -388,9 +377,7 @@ TEST(MalformedFrames, TenThousandFromFiftyClientsLeaveTheAgentServingWithoutGrow
     // 10,000 frames and 300 KiB after 50,000, levelling off. Kept frames would grow with them.
     constexpr long kFloodSlackKiB = 512;
     test::AgentProcess agent;
-    agent.writeRootFile("device.plist", Value::Dictionary{{"SerialNumber", kPhone},
-                                                          {"ProductType", "Phone1,1"},
-                                                          {"ProductVersion", "1.0"}});
+    agent.writeDevices(kPhone);
     agent.registerApplication("tests", test::selfExecutable(), std::nullopt, Value(true));
     ASSERT_TRUE(agent.start()) << agent.log();
     auto defaultDevice = [&] {
