@@ -9,6 +9,7 @@
 
 #include <asio/io_context.hpp>
 #include <asio/post.hpp>
+#include <bitset>
 #include <cerrno>
 #include <cstddef>
 #include <cstdint>
@@ -41,7 +42,10 @@ class IoQueue : public qax::TaskRunner {
 };
 
 // Answers every operation with a plausible value, but only when told to: replies wait in a
-// queue so that the connection sees many requests outstanding.
+// queue so that the connection sees many requests outstanding. A value the input does not
+// shape (a device, a list of them) is the same every time, and its archive is most of what a
+// reply costs: only an operation's first request in an input gets it, later ones get the
+// operation's empty answer. Values that carry the request's strings are always sent whole.
 class HoldingAgent : public qax::ExportedObject, public qax::QAXAgentProtocol {
   public:
     std::deque<std::function<void()>> held;
@@ -70,13 +74,19 @@ class HoldingAgent : public qax::ExportedObject, public qax::QAXAgentProtocol {
     void readWebURLOverride(std::function<void(std::optional<Value>)> reply) override {
         hold(reply, std::optional<Value>());
     }
-    void defaultDevice(qax::QAXDeviceReply reply) override { hold(reply, device("SN")); }
+    void defaultDevice(qax::QAXDeviceReply reply) override {
+        hold(reply, first(Op::DefaultDevice) ? device("SN") : nullptr);
+    }
     void pairedDevices(qax::QAXDeviceListReply reply) override {
-        hold(reply, std::vector<std::shared_ptr<qax::QAXDevice>>{device("W1"), device("W2")});
+        std::vector<std::shared_ptr<qax::QAXDevice>> devices;
+        if (first(Op::PairedDevices)) {
+            devices = {device("W1"), device("W2")};
+        }
+        hold(reply, std::move(devices));
     }
     void getDefaultDeviceInfoUsingPolicy(qax::QAXWarrantyPolicy,
                                          qax::QAXDeviceInfoReply reply) override {
-        hold(reply, info("SN"));
+        hold(reply, first(Op::DefaultDeviceInfo) ? info("SN") : nullptr);
     }
     void getDeviceInfoForSerialNumber(const std::string& serialNumber, qax::QAXWarrantyPolicy,
                                       qax::QAXDeviceInfoReply reply) override {
@@ -84,7 +94,11 @@ class HoldingAgent : public qax::ExportedObject, public qax::QAXAgentProtocol {
     }
     void getAllDeviceInfosUsingPolicy(qax::QAXWarrantyPolicy, bool,
                                       qax::QAXDeviceInfoListReply reply) override {
-        hold(reply, std::vector<std::shared_ptr<qax::QAXDeviceInfo>>{info("SN"), info("W1")});
+        std::vector<std::shared_ptr<qax::QAXDeviceInfo>> infos;
+        if (first(Op::AllDeviceInfos)) {
+            infos = {info("SN"), info("W1")};
+        }
+        hold(reply, std::move(infos));
     }
     void dismissFollowUpForSerialNumber(const std::string&, qax::QAXBoolReply reply) override {
         hold(reply, true);
@@ -94,6 +108,14 @@ class HoldingAgent : public qax::ExportedObject, public qax::QAXAgentProtocol {
     }
 
   private:
+    enum class Op { DefaultDevice, PairedDevices, DefaultDeviceInfo, AllDeviceInfos, Count };
+    std::bitset<static_cast<std::size_t>(Op::Count)> answered_;
+
+    bool first(Op op) {
+        const bool was = answered_.test(static_cast<std::size_t>(op));
+        answered_.set(static_cast<std::size_t>(op));
+        return !was;
+    }
     template <typename Reply, typename V>
     void hold(Reply reply, V value) {
         held.push_back([reply = std::move(reply), value = std::move(value)] { reply(value); });
