@@ -243,8 +243,10 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
             h.settle();
         }
     }
-    // Everything still held is answered before the client hangs up. Replies are read only
-    // now: the socket buffer holds far more than an input's worth of them.
+    // Everything still held is answered before the client hangs up, once the connection has
+    // read what was sent last (its requests are held too). Replies are read only now: the
+    // socket buffer holds far more than an input's worth of them.
+    h.settle();
     while (!agent->held.empty()) {
         agent->release(agent->held.size());
         h.settle();
