@@ -3,12 +3,12 @@
 // connection sometimes reads several chunks at once, and the exported agent holds its replies
 // for a while, so frames split anywhere and requests pile up past the in-flight limit.
 // Every request that reaches the agent must be answered once with its id, a broken stream
-// must close the connection, and the connection must be gone once the client is.
+// must close the connection (and let the process go), and the connection must be gone once the
+// client is.
 #include <sys/socket.h>
 #include <unistd.h>
 
 #include <asio/io_context.hpp>
-#include <asio/post.hpp>
 #include <bitset>
 #include <cerrno>
 #include <cstddef>
@@ -30,16 +30,6 @@ namespace {
 using qax::Value;
 
 constexpr std::size_t kMaxChunk = 143;
-
-class IoQueue : public qax::TaskRunner {
-  public:
-    explicit IoQueue(asio::io_context& io) : io_(io) {}
-    void post(qax::Task task) override { asio::post(io_, std::move(task)); }
-    void postDelayed(qax::Task task, double) override { asio::post(io_, std::move(task)); }
-
-  private:
-    asio::io_context& io_;
-};
 
 // Answers every operation with a plausible value, but only when told to: replies wait in a
 // queue so that the connection sees many requests outstanding. A value the input does not
@@ -131,7 +121,6 @@ class HoldingAgent : public qax::ExportedObject, public qax::QAXAgentProtocol {
 
 struct Harness {
     asio::io_context io;
-    std::shared_ptr<qax::TaskRunner> queue = std::make_shared<IoQueue>(io);
     std::shared_ptr<const qax::RemoteInterface> interface =
         std::make_shared<qax::QAXAgentRemoteInterface>();
 
@@ -215,7 +204,11 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
     qax::HostClientConnection::Socket socket(h.io);
     socket.assign(asio::local::stream_protocol(), fds[0]);
     auto agent = std::make_shared<HoldingAgent>();
-    auto connection = std::make_shared<qax::HostClientConnection>(std::move(socket), h.queue);
+    // Stands for the process's lifecycle transaction, which the connection holds until closed.
+    auto transaction = std::make_shared<int>(0);
+    std::weak_ptr<int> keptAlive = transaction;
+    auto connection =
+        std::make_shared<qax::HostClientConnection>(std::move(socket), std::move(transaction));
     std::weak_ptr<qax::HostClientConnection> weak = connection;
     connection->exportInterface(h.interface);
     connection->exportObject(agent);
@@ -289,6 +282,9 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
         h.settle();
         if (drain(fds[1], replies) >= 0) {
             __builtin_trap();
+        }
+        if (!keptAlive.expired()) {
+            __builtin_trap();  // a closed connection still kept the process alive
         }
     }
 
