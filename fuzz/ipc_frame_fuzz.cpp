@@ -3,12 +3,13 @@
 // connection sometimes reads several chunks at once, and the exported agent holds its replies
 // for a while, so frames split anywhere and requests pile up past the in-flight limit.
 // Every request that reaches the agent must be answered once with its id, a broken stream
-// must close the connection, and the connection must be gone once the client is.
+// must close the connection (and let the process go), and the connection must be gone once the
+// client is.
 #include <sys/socket.h>
 #include <unistd.h>
 
 #include <asio/io_context.hpp>
-#include <asio/post.hpp>
+#include <bitset>
 #include <cerrno>
 #include <cstddef>
 #include <cstdint>
@@ -30,18 +31,11 @@ using qax::Value;
 
 constexpr std::size_t kMaxChunk = 143;
 
-class IoQueue : public qax::TaskRunner {
-  public:
-    explicit IoQueue(asio::io_context& io) : io_(io) {}
-    void post(qax::Task task) override { asio::post(io_, std::move(task)); }
-    void postDelayed(qax::Task task, double) override { asio::post(io_, std::move(task)); }
-
-  private:
-    asio::io_context& io_;
-};
-
 // Answers every operation with a plausible value, but only when told to: replies wait in a
-// queue so that the connection sees many requests outstanding.
+// queue so that the connection sees many requests outstanding. A value the input does not
+// shape (a device, a list of them) is the same every time, and its archive is most of what a
+// reply costs: only an operation's first request in an input gets it, later ones get the
+// operation's empty answer. Values that carry the request's strings are always sent whole.
 class HoldingAgent : public qax::ExportedObject, public qax::QAXAgentProtocol {
   public:
     std::deque<std::function<void()>> held;
@@ -70,13 +64,19 @@ class HoldingAgent : public qax::ExportedObject, public qax::QAXAgentProtocol {
     void readWebURLOverride(std::function<void(std::optional<Value>)> reply) override {
         hold(reply, std::optional<Value>());
     }
-    void defaultDevice(qax::QAXDeviceReply reply) override { hold(reply, device("SN")); }
+    void defaultDevice(qax::QAXDeviceReply reply) override {
+        hold(reply, first(Op::DefaultDevice) ? device("SN") : nullptr);
+    }
     void pairedDevices(qax::QAXDeviceListReply reply) override {
-        hold(reply, std::vector<std::shared_ptr<qax::QAXDevice>>{device("W1"), device("W2")});
+        std::vector<std::shared_ptr<qax::QAXDevice>> devices;
+        if (first(Op::PairedDevices)) {
+            devices = {device("W1"), device("W2")};
+        }
+        hold(reply, std::move(devices));
     }
     void getDefaultDeviceInfoUsingPolicy(qax::QAXWarrantyPolicy,
                                          qax::QAXDeviceInfoReply reply) override {
-        hold(reply, info("SN"));
+        hold(reply, first(Op::DefaultDeviceInfo) ? info("SN") : nullptr);
     }
     void getDeviceInfoForSerialNumber(const std::string& serialNumber, qax::QAXWarrantyPolicy,
                                       qax::QAXDeviceInfoReply reply) override {
@@ -84,7 +84,11 @@ class HoldingAgent : public qax::ExportedObject, public qax::QAXAgentProtocol {
     }
     void getAllDeviceInfosUsingPolicy(qax::QAXWarrantyPolicy, bool,
                                       qax::QAXDeviceInfoListReply reply) override {
-        hold(reply, std::vector<std::shared_ptr<qax::QAXDeviceInfo>>{info("SN"), info("W1")});
+        std::vector<std::shared_ptr<qax::QAXDeviceInfo>> infos;
+        if (first(Op::AllDeviceInfos)) {
+            infos = {info("SN"), info("W1")};
+        }
+        hold(reply, std::move(infos));
     }
     void dismissFollowUpForSerialNumber(const std::string&, qax::QAXBoolReply reply) override {
         hold(reply, true);
@@ -94,6 +98,14 @@ class HoldingAgent : public qax::ExportedObject, public qax::QAXAgentProtocol {
     }
 
   private:
+    enum class Op { DefaultDevice, PairedDevices, DefaultDeviceInfo, AllDeviceInfos, Count };
+    std::bitset<static_cast<std::size_t>(Op::Count)> answered_;
+
+    bool first(Op op) {
+        const bool was = answered_.test(static_cast<std::size_t>(op));
+        answered_.set(static_cast<std::size_t>(op));
+        return !was;
+    }
     template <typename Reply, typename V>
     void hold(Reply reply, V value) {
         held.push_back([reply = std::move(reply), value = std::move(value)] { reply(value); });
@@ -109,7 +121,6 @@ class HoldingAgent : public qax::ExportedObject, public qax::QAXAgentProtocol {
 
 struct Harness {
     asio::io_context io;
-    std::shared_ptr<qax::TaskRunner> queue = std::make_shared<IoQueue>(io);
     std::shared_ptr<const qax::RemoteInterface> interface =
         std::make_shared<qax::QAXAgentRemoteInterface>();
 
@@ -193,7 +204,11 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
     qax::HostClientConnection::Socket socket(h.io);
     socket.assign(asio::local::stream_protocol(), fds[0]);
     auto agent = std::make_shared<HoldingAgent>();
-    auto connection = std::make_shared<qax::HostClientConnection>(std::move(socket), h.queue);
+    // Stands for the process's lifecycle transaction, which the connection holds until closed.
+    auto transaction = std::make_shared<int>(0);
+    std::weak_ptr<int> keptAlive = transaction;
+    auto connection =
+        std::make_shared<qax::HostClientConnection>(std::move(socket), std::move(transaction));
     std::weak_ptr<qax::HostClientConnection> weak = connection;
     connection->exportInterface(h.interface);
     connection->exportObject(agent);
@@ -221,8 +236,10 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
             h.settle();
         }
     }
-    // Everything still held is answered before the client hangs up. Replies are read only
-    // now: the socket buffer holds far more than an input's worth of them.
+    // Everything still held is answered before the client hangs up, once the connection has
+    // read what was sent last (its requests are held too). Replies are read only now: the
+    // socket buffer holds far more than an input's worth of them.
+    h.settle();
     while (!agent->held.empty()) {
         agent->release(agent->held.size());
         h.settle();
@@ -265,6 +282,9 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
         h.settle();
         if (drain(fds[1], replies) >= 0) {
             __builtin_trap();
+        }
+        if (!keptAlive.expired()) {
+            __builtin_trap();  // a closed connection still kept the process alive
         }
     }
 
