@@ -9,8 +9,11 @@
 #include <condition_variable>
 #include <deque>
 #include <mutex>
+#include <system_error>
 #include <thread>
 #include <vector>
+
+#include "core/Log.h"
 
 namespace qax {
 namespace {
@@ -64,8 +67,14 @@ class ElasticPoolRunner : public TaskRunner,
         if (idle_ >= queue_.size()) {
             wake_.notify_one();
         } else if (running_ < max_) {
-            ++running_;
-            std::thread([self = shared_from_this()] { self->work(); }).detach();
+            try {
+                std::thread([self = shared_from_this()] { self->work(); }).detach();
+                ++running_;
+            } catch (const std::system_error& e) {
+                // Out of threads: the task waits for one that runs already, if any.
+                qaxLog().error("Cannot start a thread for blocking work: %@",
+                               std::string(e.what()));
+            }
         }
     }
 
