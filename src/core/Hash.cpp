@@ -8,8 +8,8 @@ std::array<std::uint8_t, 32> sha256(std::span<const std::uint8_t> bytes) {
     // Fetched once: looking the algorithm up by name cost more than hashing a serial number.
     static EVP_MD* const fetched = EVP_MD_fetch(nullptr, "SHA256", nullptr);
     std::array<std::uint8_t, 32> digest{};
-    EVP_Digest(bytes.data(), bytes.size(), digest.data(), nullptr,
-               fetched ? fetched : EVP_sha256(), nullptr);
+    EVP_Digest(bytes.data(), bytes.size(), digest.data(), nullptr, fetched ? fetched : EVP_sha256(),
+               nullptr);
     return digest;
 }
 
