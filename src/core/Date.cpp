@@ -2,23 +2,75 @@
 
 #include <cmath>
 #include <cstdio>
-#include <ctime>
+#include <cstring>
 
 namespace qax {
 namespace {
 
-bool breakDown(double seconds, std::tm& out, int& millis) {
+// The calendar fields of a time in UTC (proleptic Gregorian calendar).
+struct Civil {
+    long long year;
+    unsigned month, day, hour, minute, second, millis;
+};
+
+// Dates are printed in every log line that names a device, so this is done with arithmetic
+// rather than gmtime_r() (a lock) and snprintf().
+bool breakDown(double seconds, Civil& out) {
     double whole = std::floor(seconds);
     if (!std::isfinite(whole) || whole < -62135596800.0 || whole > 253402300799.0) {
         return false;
     }
-    millis = static_cast<int>(std::llround((seconds - whole) * 1000.0));
+    auto millis = static_cast<unsigned>(std::llround((seconds - whole) * 1000.0));
     if (millis >= 1000) {
         millis -= 1000;
         whole += 1;
     }
-    std::time_t t = static_cast<std::time_t>(whole);
-    return gmtime_r(&t, &out) != nullptr;
+    const auto t = static_cast<long long>(whole);
+    long long days = t / 86400;
+    long long rest = t % 86400;
+    if (rest < 0) {
+        rest += 86400;
+        --days;
+    }
+    // Civil date from days since 1970-01-01 (Howard Hinnant's algorithm).
+    days += 719468;
+    const long long era = (days >= 0 ? days : days - 146096) / 146097;
+    const auto doe = static_cast<unsigned>(days - era * 146097);
+    const unsigned yoe = (doe - doe / 1460 + doe / 36524 - doe / 146096) / 365;
+    const unsigned doy = doe - (365 * yoe + yoe / 4 - yoe / 100);
+    const unsigned mp = (5 * doy + 2) / 153;
+    out.day = doy - (153 * mp + 2) / 5 + 1;
+    out.month = mp < 10 ? mp + 3 : mp - 9;
+    out.year = static_cast<long long>(yoe) + era * 400 + (out.month <= 2);
+    out.hour = static_cast<unsigned>(rest / 3600);
+    out.minute = static_cast<unsigned>(rest / 60 % 60);
+    out.second = static_cast<unsigned>(rest % 60);
+    out.millis = millis;
+    return true;
+}
+
+// Writes `value` as exactly `width` decimal digits.
+char* digits(char* p, unsigned value, int width) {
+    for (int i = width - 1; i >= 0; --i) {
+        p[i] = static_cast<char>('0' + value % 10);
+        value /= 10;
+    }
+    return p + width;
+}
+
+// "YYYY-MM-DD?hh:mm:ss" with `separator` between date and time; returns the end.
+char* writeCivil(char* p, const Civil& c, char separator) {
+    p = digits(p, static_cast<unsigned>(c.year), 4);
+    *p++ = '-';
+    p = digits(p, c.month, 2);
+    *p++ = '-';
+    p = digits(p, c.day, 2);
+    *p++ = separator;
+    p = digits(p, c.hour, 2);
+    *p++ = ':';
+    p = digits(p, c.minute, 2);
+    *p++ = ':';
+    return digits(p, c.second, 2);
 }
 
 // Days since 1970-01-01 of a civil date (proleptic Gregorian calendar).
@@ -34,27 +86,27 @@ long long daysFromCivil(long long y, unsigned m, unsigned d) {
 }  // namespace
 
 std::string Date::description() const {
-    std::tm tm{};
-    int millis = 0;
-    if (!breakDown(seconds_, tm, millis)) {
+    Civil c{};
+    if (!breakDown(seconds_, c)) {
         return std::to_string(seconds_);
     }
-    char buf[64];
-    std::snprintf(buf, sizeof buf, "%04d-%02d-%02d %02d:%02d:%02d +0000", tm.tm_year + 1900,
-                  tm.tm_mon + 1, tm.tm_mday, tm.tm_hour, tm.tm_min, tm.tm_sec);
-    return buf;
+    char buf[32];
+    char* end = writeCivil(buf, c, ' ');
+    std::memcpy(end, " +0000", 6);
+    return std::string(buf, end + 6);
 }
 
 std::string Date::iso8601() const {
-    std::tm tm{};
-    int millis = 0;
-    if (!breakDown(seconds_, tm, millis)) {
+    Civil c{};
+    if (!breakDown(seconds_, c)) {
         return std::to_string(seconds_);
     }
-    char buf[64];
-    std::snprintf(buf, sizeof buf, "%04d-%02d-%02dT%02d:%02d:%02d.%03dZ", tm.tm_year + 1900,
-                  tm.tm_mon + 1, tm.tm_mday, tm.tm_hour, tm.tm_min, tm.tm_sec, millis);
-    return buf;
+    char buf[32];
+    char* end = writeCivil(buf, c, 'T');
+    *end++ = '.';
+    end = digits(end, c.millis, 3);
+    *end++ = 'Z';
+    return std::string(buf, end);
 }
 
 std::optional<Date> Date::parseIso8601(std::string_view text) {
