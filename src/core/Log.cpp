@@ -7,6 +7,7 @@
 #include <algorithm>
 #include <cctype>
 #include <cerrno>
+#include <charconv>
 #include <cinttypes>
 #include <cstdio>
 #include <cstdlib>
@@ -29,39 +30,46 @@ const char* logLevelName(LogLevel level) {
 
 namespace {
 
-std::string argText(const LogArg& arg) {
-    return std::visit(
-        [](const auto& v) -> std::string {
+template <typename I>
+void appendInteger(std::string& out, I value) {
+    char buf[24];
+    auto res = std::to_chars(buf, buf + sizeof buf, value);
+    out.append(buf, res.ptr);
+}
+
+// The text of one argument, appended in place: a message is built on every request.
+void appendArgText(std::string& out, const LogArg& arg) {
+    std::visit(
+        [&out](const auto& v) {
             using T = std::decay_t<decltype(v)>;
             if constexpr (std::is_same_v<T, LogArg::None>) {
-                return "(null)";
+                out += "(null)";
             } else if constexpr (std::is_same_v<T, std::string>) {
-                return v;
+                out += v;
             } else if constexpr (std::is_same_v<T, double>) {
                 char buf[64];
-                std::snprintf(buf, sizeof buf, "%g", v);
-                return buf;
+                const int n = std::snprintf(buf, sizeof buf, "%g", v);
+                out.append(buf, static_cast<std::size_t>(std::clamp(n, 0, 63)));
             } else {
-                return std::to_string(v);
+                appendInteger(out, v);
             }
         },
         arg.v);
 }
 
-std::string argInteger(const LogArg& arg, bool isUnsigned) {
+void appendArgInteger(std::string& out, const LogArg& arg, bool isUnsigned) {
     if (auto* i = std::get_if<std::int64_t>(&arg.v)) {
-        return isUnsigned ? std::to_string(static_cast<std::uint64_t>(*i)) : std::to_string(*i);
+        isUnsigned ? appendInteger(out, static_cast<std::uint64_t>(*i)) : appendInteger(out, *i);
+    } else if (auto* u = std::get_if<std::uint64_t>(&arg.v)) {
+        isUnsigned ? appendInteger(out, *u) : appendInteger(out, static_cast<std::int64_t>(*u));
+    } else if (auto* d = std::get_if<double>(&arg.v)) {
+        appendInteger(out, static_cast<std::int64_t>(*d));
+    } else {
+        appendArgText(out, arg);
     }
-    if (auto* u = std::get_if<std::uint64_t>(&arg.v)) {
-        return isUnsigned ? std::to_string(*u) : std::to_string(static_cast<std::int64_t>(*u));
-    }
-    if (auto* d = std::get_if<double>(&arg.v)) {
-        return std::to_string(static_cast<std::int64_t>(*d));
-    }
-    return argText(arg);
 }
 
-std::string argDouble(const LogArg& arg, int precision) {
+void appendArgDouble(std::string& out, const LogArg& arg, int precision) {
     double d = 0;
     if (auto* p = std::get_if<double>(&arg.v)) {
         d = *p;
@@ -70,11 +78,12 @@ std::string argDouble(const LogArg& arg, int precision) {
     } else if (auto* u = std::get_if<std::uint64_t>(&arg.v)) {
         d = static_cast<double>(*u);
     } else {
-        return argText(arg);
+        appendArgText(out, arg);
+        return;
     }
-    char buf[64];
-    std::snprintf(buf, sizeof buf, "%.*f", precision, d);
-    return buf;
+    char buf[512];
+    const int n = std::snprintf(buf, sizeof buf, "%.*f", precision, d);
+    out.append(buf, static_cast<std::size_t>(std::clamp(n, 0, 511)));
 }
 
 }  // namespace
@@ -173,28 +182,27 @@ std::string formatLogMessage(std::string_view format, const std::vector<LogArg>&
         if (!arg) {
             arg = &kMissing;
         }
-        std::string text;
+        if (isPrivate && !showPrivate) {
+            out += kRedacted;
+            i = j;
+            continue;
+        }
         switch (format[j]) {
-            case '@':
-            case 's':
-                text = argText(*arg);
-                break;
             case 'd':
             case 'i':
-                text = argInteger(*arg, false);
+                appendArgInteger(out, *arg, false);
                 break;
             case 'u':
-                text = argInteger(*arg, true);
+                appendArgInteger(out, *arg, true);
                 break;
             case 'f':
             case 'g':
-                text = argDouble(*arg, precision);
+                appendArgDouble(out, *arg, precision);
                 break;
-            default:
-                text = argText(*arg);
+            default:  // '@', 's' and the rest
+                appendArgText(out, *arg);
                 break;
         }
-        out += (isPrivate && !showPrivate) ? "<private>" : text;
         i = j;
     }
     return out;
@@ -247,7 +255,16 @@ std::string StderrLogSink::formatLine(LogLevel level, std::string_view subsystem
                                       std::string_view category, std::string_view message,
                                       std::string_view time, bool journal) {
     std::string line;
-    line.reserve(message.size() + 80);
+    appendLine(line, level, subsystem, category, message, time, journal);
+    return line;
+}
+
+void StderrLogSink::appendLine(std::string& line, LogLevel level, std::string_view subsystem,
+                               std::string_view category, std::string_view message,
+                               std::string_view time, bool journal) {
+    if (line.empty()) {
+        line.reserve(message.size() + 80);
+    }
     if (journal) {
         switch (level) {
             case LogLevel::Error:
@@ -266,7 +283,6 @@ std::string StderrLogSink::formatLine(LogLevel level, std::string_view subsystem
     line.append(logLevelName(level)).append(" ");
     line.append(subsystem).append(":").append(category).append(" ").append(message);
     line += '\n';
-    return line;
 }
 
 namespace {
@@ -354,7 +370,7 @@ void StderrLogSink::write(LogLevel level, std::string_view subsystem, std::strin
         writeToStderr(formatLine(level, subsystem, category, message, stamp, journal_));
         return;
     }
-    held.text += formatLine(level, subsystem, category, message, stamp, journal_);
+    appendLine(held.text, level, subsystem, category, message, stamp, journal_);
     // An error goes out at once, with what led to it: the process may be about to end.
     if (level == LogLevel::Error || held.text.size() > kMaxHeldBytes) {
         writeHeldLines(held);

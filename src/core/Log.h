@@ -201,6 +201,10 @@ class StderrLogSink : public LogSink {
     static std::string formatLine(LogLevel level, std::string_view subsystem,
                                   std::string_view category, std::string_view message,
                                   std::string_view time, bool journal);
+    // The same line appended to `out`.
+    static void appendLine(std::string& out, LogLevel level, std::string_view subsystem,
+                           std::string_view category, std::string_view message,
+                           std::string_view time, bool journal);
     // Whether `fd` is the stream JOURNAL_STREAM ("device:inode") names.
     static bool isJournalStream(const char* journalStream, int fd);
     // Writes `bytes` to stderr with one write() where it can.

@@ -1,6 +1,5 @@
 #include "core/Value.h"
 
-#include <cctype>
 #include <charconv>
 #include <cmath>
 #include <cstdio>
@@ -154,8 +153,12 @@ bool needsQuotes(const std::string& s) {
     if (s.empty()) {
         return true;
     }
+    // ASCII letters and digits only (the process never leaves the "C" locale).
     for (unsigned char c : s) {
-        if (!(std::isalnum(c) || c == '_' || c == '.' || c == '$' || c == '/' || c == ':')) {
+        const bool plain = (c >= 'a' && c <= 'z') || (c >= 'A' && c <= 'Z') ||
+                           (c >= '0' && c <= '9') || c == '_' || c == '.' || c == '$' || c == '/' ||
+                           c == ':';
+        if (!plain) {
             return true;
         }
     }
@@ -186,6 +189,12 @@ void appendQuoted(std::string& out, const std::string& s) {
     out += '"';
 }
 
+void appendInteger(std::string& out, std::int64_t i) {
+    char buf[24];
+    auto res = std::to_chars(buf, buf + sizeof buf, i);
+    out.append(buf, res.ptr);
+}
+
 std::string formatDouble(double d) {
     char buf[64];
     auto res = std::to_chars(buf, buf + sizeof buf, d);
@@ -201,8 +210,12 @@ std::string Value::description() const {
 }
 
 void Value::describe(std::string& out, int indent, bool topLevel) const {
-    const std::string pad(static_cast<std::size_t>(indent + 1) * 4, ' ');
-    const std::string closePad(static_cast<std::size_t>(indent) * 4, ' ');
+    // Each nesting level indents by four spaces; appended in place (descriptions are built
+    // for log lines on every request).
+    auto newline = [&out](int level) {
+        out += '\n';
+        out.append(static_cast<std::size_t>(level) * 4, ' ');
+    };
     switch (kind()) {
         case Kind::Null:
             out += "<null>";
@@ -211,7 +224,7 @@ void Value::describe(std::string& out, int indent, bool topLevel) const {
             out += std::get<bool>(v_) ? "1" : "0";
             break;
         case Kind::Integer:
-            out += std::to_string(std::get<std::int64_t>(v_));
+            appendInteger(out, std::get<std::int64_t>(v_));
             break;
         case Kind::Real:
             out += formatDouble(std::get<double>(v_));
@@ -227,7 +240,9 @@ void Value::describe(std::string& out, int indent, bool topLevel) const {
             if (topLevel) {
                 out += std::get<qax::Date>(v_).description();
             } else {
-                out += '"' + std::get<qax::Date>(v_).description() + '"';
+                out += '"';
+                out += std::get<qax::Date>(v_).description();
+                out += '"';
             }
             break;
         case Kind::Data: {
@@ -248,26 +263,32 @@ void Value::describe(std::string& out, int indent, bool topLevel) const {
             const auto& a = std::get<Array>(v_);
             out += "(";
             for (std::size_t i = 0; i < a.size(); ++i) {
-                out += "\n" + pad;
+                newline(indent + 1);
                 a[i].describe(out, indent + 1, false);
                 if (i + 1 < a.size()) {
                     out += ',';
                 }
             }
-            out += a.empty() ? ")" : "\n" + closePad + ")";
+            if (!a.empty()) {
+                newline(indent);
+            }
+            out += ')';
             break;
         }
         case Kind::Dictionary: {
             const auto& d = std::get<Dictionary>(v_);
             out += "{";
             for (const auto& [k, v] : d) {
-                out += "\n" + pad;
+                newline(indent + 1);
                 appendQuoted(out, k);
                 out += " = ";
                 v.describe(out, indent + 1, false);
                 out += ';';
             }
-            out += d.empty() ? "}" : "\n" + closePad + "}";
+            if (!d.empty()) {
+                newline(indent);
+            }
+            out += '}';
             break;
         }
     }
