@@ -1,5 +1,7 @@
 #include "core/Hash.h"
 
+#include <array>
+
 #include <openssl/evp.h>
 
 namespace qax {
@@ -17,6 +19,24 @@ std::string sha256Hash(std::string_view text) {
     if (auto zero = text.find('\0'); zero != std::string_view::npos) {
         text = text.substr(0, zero);
     }
+    // Serial numbers are hashed several times in each request (file names, preference keys,
+    // follow-up identifiers): the last few short texts hashed on this thread are remembered.
+    struct Remembered {
+        std::string text;
+        std::string hash;
+    };
+    constexpr std::size_t kRemembered = 8;
+    constexpr std::size_t kLongestRemembered = 64;
+    thread_local std::array<Remembered, kRemembered> remembered;
+    thread_local std::size_t next = 0;
+    const bool remember = text.size() <= kLongestRemembered;
+    if (remember) {
+        for (const auto& r : remembered) {
+            if (!r.hash.empty() && r.text == text) {
+                return r.hash;
+            }
+        }
+    }
     auto digest = sha256(std::span<const std::uint8_t>(
         reinterpret_cast<const std::uint8_t*>(text.data()), text.size()));
     static const char* hex = "0123456789abcdef";
@@ -25,6 +45,10 @@ std::string sha256Hash(std::string_view text) {
     for (auto b : digest) {
         out += hex[b >> 4];
         out += hex[b & 15];
+    }
+    if (remember) {
+        remembered[next] = {std::string(text), out};
+        next = (next + 1) % kRemembered;
     }
     return out;
 }
