@@ -157,10 +157,6 @@ bool flag(const Value* v) {
     return v && v->truthy();
 }
 
-std::optional<Value> asIs(const Value* v) {
-    return v ? std::optional<Value>(*v) : std::nullopt;
-}
-
 double daysInSeconds(const Value* v) {
     if (!v) {
         return 0;
@@ -339,67 +335,69 @@ QAXWarranty::QAXWarranty(std::shared_ptr<Platform> platform,
     Fields& f = fields_;
     f.covered = flag(top(kCoveredKey));
     f.coverageEndDate = _dateWithEpochNumber(top(kCoverageEndDateKey));
-    f.localizedCoveredDeviceDateLabelFormat = asIs(top(kLocalizedCoveredDeviceDateLabelFormatKey));
-    f.coverageLocalizedLabel = asIs(top(kCoverageLocalizedLabelKey));
-    f.coverageLocalizedDesc = asIs(top(kCoverageLocalizedDescKey));
-    f.coverageLocalizedDescLong = asIs(top(kCoverageLocalizedDescLongKey));
-    f.coverageLocalizedExpirationLabel = asIs(top(kCoverageLocalizedExpirationLabelKey));
-    f.footer1FormatString = asIs(top(kFooter1FormatStringKey));
-    f.footer1LinkLabel = asIs(top(kFooter1LinkLabelKey));
-    f.footer1LinkURL = asIs(top(kFooter1LinkURLKey));
-    f.footer2FormatString = asIs(top(kFooter2FormatStringKey));
-    f.footer2LinkLabel = asIs(top(kFooter2LinkLabelKey));
-    f.footer2LinkURL = asIs(top(kFooter2LinkURLKey));
+    f.localizedCoveredDeviceDateLabelFormat =
+        ValueField(top(kLocalizedCoveredDeviceDateLabelFormatKey));
+    f.coverageLocalizedLabel = ValueField(top(kCoverageLocalizedLabelKey));
+    f.coverageLocalizedDesc = ValueField(top(kCoverageLocalizedDescKey));
+    f.coverageLocalizedDescLong = ValueField(top(kCoverageLocalizedDescLongKey));
+    f.coverageLocalizedExpirationLabel = ValueField(top(kCoverageLocalizedExpirationLabelKey));
+    f.footer1FormatString = ValueField(top(kFooter1FormatStringKey));
+    f.footer1LinkLabel = ValueField(top(kFooter1LinkLabelKey));
+    f.footer1LinkURL = ValueField(top(kFooter1LinkURLKey));
+    f.footer2FormatString = ValueField(top(kFooter2FormatStringKey));
+    f.footer2LinkLabel = ValueField(top(kFooter2LinkLabelKey));
+    f.footer2LinkURL = ValueField(top(kFooter2LinkURLKey));
     f.hvOfferEligible = flag(top(kHvOfferEligibleKey));
     f.hvOfferEligibleUntil = _dateWithEpochNumber(top(kHvOfferEligibleUntilKey));
     f.hvOfferFollowupDisplayDate = _dateWithEpochNumber(top(kHvOfferFollowupDisplayDateKey));
     f.hvOfferDisplayDate = _dateWithEpochNumber(top(kHvOfferDisplayDateKey));
-    f.hvOfferIdentifier = asIs(top(kHvOfferIdentifierKey));
-    f.hvLocalizedOfferLabel = asIs(top(kHvLocalizedOfferLabelKey));
-    f.hvLocalizedOfferPluralDescFormat = asIs(top(kHvLocalizedOfferPluralDescFormatKey));
-    f.hvLocalizedOfferSingularDesc = asIs(top(kHvLocalizedOfferSingularDescKey));
-    f.hvNotificationLocalizedOfferLabel = asIs(top(kHvNotificationLocalizedOfferLabelKey));
+    f.hvOfferIdentifier = ValueField(top(kHvOfferIdentifierKey));
+    f.hvLocalizedOfferLabel = ValueField(top(kHvLocalizedOfferLabelKey));
+    f.hvLocalizedOfferPluralDescFormat = ValueField(top(kHvLocalizedOfferPluralDescFormatKey));
+    f.hvLocalizedOfferSingularDesc = ValueField(top(kHvLocalizedOfferSingularDescKey));
+    f.hvNotificationLocalizedOfferLabel = ValueField(top(kHvNotificationLocalizedOfferLabelKey));
     f.hvNotificationLocalizedOfferSingularDesc =
-        asIs(top(kHvNotificationLocalizedOfferSingularDescKey));
+        ValueField(top(kHvNotificationLocalizedOfferSingularDescKey));
     f.hvNotificationLocalizedOfferPluralDescFormat =
-        asIs(top(kHvNotificationLocalizedOfferPluralDescFormatKey));
-    f.hvLocalizedOfferCTA = asIs(top(kHvLocalizedOfferCTAKey));
-    f.hvLocalizedOfferDetails = asIs(top(kHvLocalizedOfferDetailsKey));
+        ValueField(top(kHvNotificationLocalizedOfferPluralDescFormatKey));
+    f.hvLocalizedOfferCTA = ValueField(top(kHvLocalizedOfferCTAKey));
+    f.hvLocalizedOfferDetails = ValueField(top(kHvLocalizedOfferDetailsKey));
     f.hvLocalizedOfferDetailsPluralEligibilityFormat =
-        asIs(top(kHvLocalizedOfferDetailsPluralEligibilityFormatKey));
+        ValueField(top(kHvLocalizedOfferDetailsPluralEligibilityFormatKey));
     f.hvLocalizedOfferDetailsSingularEligibility =
-        asIs(top(kHvLocalizedOfferDetailsSingularEligibilityKey));
+        ValueField(top(kHvLocalizedOfferDetailsSingularEligibilityKey));
     f.hvOfferDisplay = flag(toggles(kHvOfferDisplayKey));
     f.hvOfferSettingsAppBadge = flag(toggles(kHvOfferSettingsAppBadgeKey));
     f.hvOfferSettingsRowBadge = flag(toggles(kHvOfferSettingsRowBadgeKey));
     f.hvOfferDurationBeforeEndDate = daysInSeconds(toggles(kHvOfferDurationDaysBeforeEndDateKey));
-    f.hvOfferToggle = asIs(toggles(kHvOfferToggleKey));
-    f.hvOfferPromoFormat = asIs(top(kHvOfferPromoFormatKey));
-    f.hvOfferPromoNew = asIs(top(kHvOfferPromoNewKey));
+    f.hvOfferToggle = ValueField(toggles(kHvOfferToggleKey));
+    f.hvOfferPromoFormat = ValueField(top(kHvOfferPromoFormatKey));
+    f.hvOfferPromoNew = ValueField(top(kHvOfferPromoNewKey));
     f.hvOfferBadgeDurationBeforeEndDate = daysInSeconds(top(kHvOfferBadgeBeforeEndDateKey));
     f.coverageHasHVLogo = flag(top(kHvLogoToggleKey));
-    f.localizedCoverageSubTitleForServicesPartnerString = asIs(top(kHvServicesPartnerKey));
-    f.localizedCoverageFooterFormatString = asIs(coverage(kLocalizedCoverageFooterFormatStringKey));
-    f.localizedCoverageFooterLinkLabel = asIs(coverage(kLocalizedCoverageFooterLinkLabelKey));
-    f.localizedSupportAppLabel = asIs(top(kLocalizedSupportAppLabelKey));
-    f.localizedSupportAppFooter = asIs(top(kLocalizedSupportAppFooterKey));
+    f.localizedCoverageSubTitleForServicesPartnerString = ValueField(top(kHvServicesPartnerKey));
+    f.localizedCoverageFooterFormatString =
+        ValueField(coverage(kLocalizedCoverageFooterFormatStringKey));
+    f.localizedCoverageFooterLinkLabel = ValueField(coverage(kLocalizedCoverageFooterLinkLabelKey));
+    f.localizedSupportAppLabel = ValueField(top(kLocalizedSupportAppLabelKey));
+    f.localizedSupportAppFooter = ValueField(top(kLocalizedSupportAppFooterKey));
     f.isCoveragePlanSubscriptionType = flag(top(kIsHvSubscriptionKey));
-    f.localizedManagePlanLabel = asIs(top(kLocalizedManagePlanLabelKey));
-    f.hvOfferBadgeDaysBeforeEndDate = asIs(top(kHvOfferBadgeBeforeEndDateKey));
+    f.localizedManagePlanLabel = ValueField(top(kLocalizedManagePlanLabelKey));
+    f.hvOfferBadgeDaysBeforeEndDate = ValueField(top(kHvOfferBadgeBeforeEndDateKey));
     f.isHVServicesPartner = flag(top(kIsHvServicesPartnerKey));
     // After the end date, which it may be derived from.
     f.hvOfferConversionDate = conversionDate(d, f.coverageEndDate);
-    f.coverageDetailsDictionary = asIs(top(kCoverage));
-    f.localizedCoverageDetailsTitle = asIs(coverage(kLocalizedCoverageTitleKey));
-    f.coverageDetailsArray = asIs(coverage(kCoverageDetailsKey));
-    f.coverageBenefitsDictionary = asIs(coverage(kBenefitsCard));
-    f.localizedBenefitsCardTitle = asIs(card(kLocalizedBenefitsCardTitleKey));
-    f.localizedBenefitsCardSubTitle = asIs(card(kLocalizedBenefitsCardSubTitleKey));
-    f.benefitDetailsArray = asIs(card(kBenefitDetailsKey));
-    f.localizedBenefitsCardFooter = asIs(card(kLocalizedBenefitsCardFooterKey));
+    f.coverageDetailsDictionary = ValueField(top(kCoverage));
+    f.localizedCoverageDetailsTitle = ValueField(coverage(kLocalizedCoverageTitleKey));
+    f.coverageDetailsArray = ValueField(coverage(kCoverageDetailsKey));
+    f.coverageBenefitsDictionary = ValueField(coverage(kBenefitsCard));
+    f.localizedBenefitsCardTitle = ValueField(card(kLocalizedBenefitsCardTitleKey));
+    f.localizedBenefitsCardSubTitle = ValueField(card(kLocalizedBenefitsCardSubTitleKey));
+    f.benefitDetailsArray = ValueField(card(kBenefitDetailsKey));
+    f.localizedBenefitsCardFooter = ValueField(card(kLocalizedBenefitsCardFooterKey));
     f.displayRepairAndSupport = flag(top(kDisplayRepairAndSupportKey));
-    f.agsURL = asIs(top(kAgsURLKey));
-    f.supportAppURL = asIs(top(kSupportAppURLKey));
+    f.agsURL = ValueField(top(kAgsURLKey));
+    f.supportAppURL = ValueField(top(kSupportAppURLKey));
     f.showNotificationToggle = flag(top(kShowNotificationToggleKey));
     f.showNotificationBeforeEndDate = daysInSeconds(top(kShowNotificationBeforeEndDateKey));
 }

@@ -389,70 +389,88 @@ class QAXWarranty {
     static std::string _warrantyPathForSerialNumberFormat(const Platform& platform);
 
   private:
+    // A field taken from the record's dictionary points into it (the dictionary is shared and
+    // never changes while the record lives); a setter gives the field a value of its own.
+    // Records are built on every request from cached files, and copying each field out of the
+    // dictionary was most of that work.
+    class ValueField {
+      public:
+        ValueField() = default;
+        explicit ValueField(const Value* borrowed) : borrowed_(borrowed) {}
+        ValueField(std::optional<Value> owned) : owned_(std::move(owned)) {}
+        std::optional<Value> value() const {
+            return borrowed_ ? std::optional<Value>(*borrowed_) : owned_;
+        }
+
+      private:
+        std::optional<Value> owned_;
+        const Value* borrowed_ = nullptr;
+    };
+
     struct Fields {
         bool covered = false;
         std::optional<Date> coverageEndDate;
         std::optional<Date> coverageValidityDate;
-        std::optional<Value> localizedCoveredDeviceDateLabelFormat;
-        std::optional<Value> coverageLocalizedLabel;
-        std::optional<Value> coverageLocalizedDesc;
-        std::optional<Value> coverageLocalizedDescLong;
-        std::optional<Value> coverageLocalizedExpirationLabel;
-        std::optional<Value> footer1FormatString;
-        std::optional<Value> footer1LinkLabel;
-        std::optional<Value> footer1LinkURL;
-        std::optional<Value> footer2FormatString;
-        std::optional<Value> footer2LinkLabel;
-        std::optional<Value> footer2LinkURL;
+        ValueField localizedCoveredDeviceDateLabelFormat;
+        ValueField coverageLocalizedLabel;
+        ValueField coverageLocalizedDesc;
+        ValueField coverageLocalizedDescLong;
+        ValueField coverageLocalizedExpirationLabel;
+        ValueField footer1FormatString;
+        ValueField footer1LinkLabel;
+        ValueField footer1LinkURL;
+        ValueField footer2FormatString;
+        ValueField footer2LinkLabel;
+        ValueField footer2LinkURL;
         bool hvOfferEligible = false;
         std::optional<Date> hvOfferEligibleUntil;
         std::optional<Date> hvOfferFollowupDisplayDate;
         std::optional<Date> hvOfferDisplayDate;
-        std::optional<Value> hvOfferIdentifier;
-        std::optional<Value> hvLocalizedOfferLabel;
-        std::optional<Value> hvLocalizedOfferPluralDescFormat;
-        std::optional<Value> hvLocalizedOfferSingularDesc;
-        std::optional<Value> hvNotificationLocalizedOfferLabel;
-        std::optional<Value> hvNotificationLocalizedOfferSingularDesc;
-        std::optional<Value> hvNotificationLocalizedOfferPluralDescFormat;
-        std::optional<Value> hvLocalizedOfferCTA;
-        std::optional<Value> hvLocalizedOfferDetails;
-        std::optional<Value> hvLocalizedOfferDetailsPluralEligibilityFormat;
-        std::optional<Value> hvLocalizedOfferDetailsSingularEligibility;
+        ValueField hvOfferIdentifier;
+        ValueField hvLocalizedOfferLabel;
+        ValueField hvLocalizedOfferPluralDescFormat;
+        ValueField hvLocalizedOfferSingularDesc;
+        ValueField hvNotificationLocalizedOfferLabel;
+        ValueField hvNotificationLocalizedOfferSingularDesc;
+        ValueField hvNotificationLocalizedOfferPluralDescFormat;
+        ValueField hvLocalizedOfferCTA;
+        ValueField hvLocalizedOfferDetails;
+        ValueField hvLocalizedOfferDetailsPluralEligibilityFormat;
+        ValueField hvLocalizedOfferDetailsSingularEligibility;
         bool hvOfferDisplay = false;
         bool hvOfferSettingsAppBadge = false;
         bool hvOfferSettingsRowBadge = false;
         double hvOfferDurationBeforeEndDate = 0;
-        std::optional<Value> hvOfferToggle;
-        std::optional<Value> hvOfferPromoFormat;
-        std::optional<Value> hvOfferPromoNew;
+        ValueField hvOfferToggle;
+        ValueField hvOfferPromoFormat;
+        ValueField hvOfferPromoNew;
         double hvOfferBadgeDurationBeforeEndDate = 0;
         bool coverageHasHVLogo = false;
-        std::optional<Value> localizedCoverageSubTitleForServicesPartnerString;
-        std::optional<Value> localizedCoverageFooterFormatString;
-        std::optional<Value> localizedCoverageFooterLinkLabel;
-        std::optional<Value> localizedSupportAppLabel;
-        std::optional<Value> localizedSupportAppFooter;
+        ValueField localizedCoverageSubTitleForServicesPartnerString;
+        ValueField localizedCoverageFooterFormatString;
+        ValueField localizedCoverageFooterLinkLabel;
+        ValueField localizedSupportAppLabel;
+        ValueField localizedSupportAppFooter;
         bool isCoveragePlanSubscriptionType = false;
-        std::optional<Value> localizedManagePlanLabel;
-        std::optional<Value> hvOfferBadgeDaysBeforeEndDate;
+        ValueField localizedManagePlanLabel;
+        ValueField hvOfferBadgeDaysBeforeEndDate;
         bool isHVServicesPartner = false;
         std::optional<Date> hvOfferConversionDate;
-        std::optional<Value> coverageDetailsDictionary;
-        std::optional<Value> localizedCoverageDetailsTitle;
-        std::optional<Value> coverageDetailsArray;
-        std::optional<Value> localizedCoverageDetailsLabel;
-        std::optional<Value> localizedCoverageDetailsValue;
-        std::optional<Value> coverageBenefitsDictionary;
-        std::optional<Value> localizedBenefitsCardTitle;
-        std::optional<Value> localizedBenefitsCardSubTitle;
-        std::optional<Value> benefitDetailsArray;
-        std::optional<Value> localizedBenefitLabelKey;
-        std::optional<Value> localizedBenefitValueKey;
-        std::optional<Value> localizedBenefitsCardFooter;
+        ValueField coverageDetailsDictionary;
+        ValueField localizedCoverageDetailsTitle;
+        ValueField coverageDetailsArray;
+        ValueField localizedCoverageDetailsLabel;
+        ValueField localizedCoverageDetailsValue;
+        ValueField coverageBenefitsDictionary;
+        ValueField localizedBenefitsCardTitle;
+        ValueField localizedBenefitsCardSubTitle;
+        ValueField benefitDetailsArray;
+        ValueField localizedBenefitLabelKey;
+        ValueField localizedBenefitValueKey;
+        ValueField localizedBenefitsCardFooter;
         bool displayRepairAndSupport = false;
-        std::optional<Value> agsURL;
-        std::optional<Value> supportAppURL;
+        ValueField agsURL;
+        ValueField supportAppURL;
         std::optional<std::string> serialNumber;
         bool showNotificationToggle = false;
         double showNotificationBeforeEndDate = 0;
@@ -462,6 +480,10 @@ class QAXWarranty {
     T get(T Fields::*field) const {
         std::lock_guard<std::mutex> lock(mutex_);
         return fields_.*field;
+    }
+    std::optional<Value> get(ValueField Fields::*field) const {
+        std::lock_guard<std::mutex> lock(mutex_);
+        return (fields_.*field).value();
     }
     template <typename T, typename U>
     void set(T Fields::*field, U&& value) {
