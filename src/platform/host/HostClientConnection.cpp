@@ -218,17 +218,17 @@ bool HostClientConnection::handleFrame(std::string_view payload) {
 }
 
 void HostClientConnection::sendReply(std::int64_t id, RemoteReply reply) {
-    Value::Dictionary message{{kIdKey, Value(id)}};
+    // The reply is moved into the message, never copied: it may hold whole coverage summaries.
+    Value message{Value::Dictionary{{kIdKey, Value(id)}}};
     if (reply.error) {
         message[kErrorKey] = *reply.error;
     } else if (reply.value) {
         message[kReplyKey] = std::move(*reply.value);
     }
-    auto frame = IpcFrameCodec::encode(Value(message));
+    auto frame = IpcFrameCodec::encode(message);
     if (!frame) {
-        message.erase(kReplyKey);
-        message[kErrorKey] = "reply cannot be encoded";
-        frame = IpcFrameCodec::encode(Value(std::move(message)));
+        frame = IpcFrameCodec::encode(Value(
+            Value::Dictionary{{kIdKey, Value(id)}, {kErrorKey, Value("reply cannot be encoded")}}));
     }
     // On the strand already (a request answered at once) this runs now; from another thread
     // it is queued there.
