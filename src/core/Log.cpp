@@ -111,20 +111,29 @@ std::string resolvePrivateText(std::string message, bool showPrivate) {
     if (begin == std::string::npos) {
         return message;
     }
+    // Copied in runs between marks.
+    static constexpr char kMarks[] = {kPrivateBegin, kPrivateEnd, '\0'};
     std::string out(message, 0, begin);
     int depth = 0;
-    for (std::size_t i = begin; i < message.size(); ++i) {
-        const char c = message[i];
-        if (c == kPrivateBegin) {
+    std::size_t at = begin;
+    while (at < message.size()) {
+        const std::size_t mark = message.find_first_of(kMarks, at);
+        const std::size_t end = mark == std::string::npos ? message.size() : mark;
+        if (depth == 0 || showPrivate) {
+            out.append(message, at, end - at);
+        }
+        if (mark == std::string::npos) {
+            break;
+        }
+        if (message[mark] == kPrivateBegin) {
             // A nested mark (a private description inside a private one) is one span.
             if (depth++ == 0 && !showPrivate) {
                 out += kRedacted;
             }
-        } else if (c == kPrivateEnd) {
+        } else {
             depth = depth > 0 ? depth - 1 : 0;
-        } else if (depth == 0 || showPrivate) {
-            out += c;
         }
+        at = mark + 1;
     }
     return out;
 }
@@ -138,7 +147,15 @@ std::string formatLogMessage(std::string_view format, const std::vector<LogArg>&
     static const LogArg kMissing{};
     for (std::size_t i = 0; i < format.size(); ++i) {
         char c = format[i];
-        if (c != '%' || i + 1 == format.size()) {
+        if (c != '%') {
+            // The literal text up to the next conversion, at once.
+            const std::size_t percent = format.find('%', i);
+            const std::size_t end = percent == std::string_view::npos ? format.size() : percent;
+            out.append(format.substr(i, end - i));
+            i = end - 1;
+            continue;
+        }
+        if (i + 1 == format.size()) {
             out += c;
             continue;
         }

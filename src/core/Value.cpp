@@ -171,20 +171,17 @@ void appendQuoted(std::string& out, const std::string& s) {
         return;
     }
     out += '"';
-    for (char c : s) {
-        switch (c) {
-            case '"':
-                out += "\\\"";
-                break;
-            case '\\':
-                out += "\\\\";
-                break;
-            case '\n':
-                out += "\\n";
-                break;
-            default:
-                out += c;
+    // Copied in runs between the characters that need an escape.
+    std::size_t at = 0;
+    while (at < s.size()) {
+        const std::size_t special = s.find_first_of("\"\\\n", at);
+        if (special == std::string::npos) {
+            out.append(s, at);
+            break;
         }
+        out.append(s, at, special - at);
+        out += s[special] == '\n' ? "\\n" : s[special] == '"' ? "\\\"" : "\\\\";
+        at = special + 1;
     }
     out += '"';
 }

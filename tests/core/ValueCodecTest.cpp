@@ -169,10 +169,15 @@ TEST(ValueEquality, NumbersCompareByValue) {
 TEST(ValueDescription, ReadsLikeTheLogsShowIt) {
     Value v(Value::Dictionary{{"HighServerVersion", 3},
                               {"name", "Default Device"},
-                              {"list", Value(Value::Array{1, "a b"})}});
+                              {"list", Value(Value::Array{1, "a b"})},
+                              {"none", Value(Value::Array{})},
+                              {"quote", "a \"b\" \\ c\nd"},
+                              {"when", Date(1700000000)}});
     EXPECT_EQ(v.description(),
               "{\n    HighServerVersion = 3;\n    list = (\n        1,\n        \"a b\"\n    );\n"
-              "    name = \"Default Device\";\n}");
+              "    name = \"Default Device\";\n    none = ();\n"
+              "    quote = \"a \\\"b\\\" \\\\ c\\nd\";\n"
+              "    when = \"2023-11-14 22:13:20 +0000\";\n}");
     EXPECT_EQ(Value("plain text").description(), "plain text");
     EXPECT_EQ(Value(Date(1700000000)).description(), "2023-11-14 22:13:20 +0000");
 }
