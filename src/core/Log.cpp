@@ -138,7 +138,7 @@ std::string resolvePrivateText(std::string message, bool showPrivate) {
     return out;
 }
 
-std::string formatLogMessage(std::string_view format, const std::vector<LogArg>& args,
+std::string formatLogMessage(std::string_view format, std::span<const LogArg> args,
                              bool showPrivate) {
     std::string out;
     out.reserve(format.size() + 32);

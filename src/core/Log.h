@@ -3,11 +3,13 @@
 // are called concurrently and must lock for themselves.
 #pragma once
 
+#include <array>
 #include <concepts>
 #include <cstdint>
 #include <memory>
 #include <mutex>
 #include <optional>
+#include <span>
 #include <string>
 #include <string_view>
 #include <type_traits>
@@ -121,8 +123,13 @@ std::string logDescriptionOfList(const Range& objects) {
 }
 
 // Expands %@, %{private}@, %{public}@, %{public}s, %s, %d, %ld, %lu, %u, %.02f, %f and %%.
-std::string formatLogMessage(std::string_view format, const std::vector<LogArg>& args,
+std::string formatLogMessage(std::string_view format, std::span<const LogArg> args,
                              bool showPrivate);
+inline std::string formatLogMessage(std::string_view format, std::initializer_list<LogArg> args,
+                                    bool showPrivate) {
+    return formatLogMessage(format, std::span<const LogArg>(args.begin(), args.size()),
+                            showPrivate);
+}
 
 class Log {
   public:
@@ -147,7 +154,7 @@ class Log {
         if (!s || !s->isEnabled(level)) {
             return;
         }
-        std::vector<LogArg> list{toLogArg(args)...};
+        const std::array<LogArg, sizeof...(A)> list{toLogArg(args)...};
         const bool showPrivate = s->showsPrivate();
         s->write(level, subsystem_, category_,
                  resolvePrivateText(formatLogMessage(format, list, showPrivate), showPrivate));
