@@ -11,6 +11,7 @@
 #include <thread>
 #include <vector>
 
+#include "fakes/Await.h"
 #include "fakes/FakeServices.h"
 #include "fakes/TestHttpsServer.h"
 #include "fakes/TestPlatform.h"
@@ -67,14 +68,7 @@ CurlHttpClient::Options trusting(const TestHttpsServer& server) {
 }
 
 HttpResult sendAndWait(HttpClient& client, const HttpRequest& request) {
-    auto promise = std::make_shared<std::promise<HttpResult>>();
-    auto future = promise->get_future();
-    client.send(request, [promise](HttpResult r) { promise->set_value(std::move(r)); });
-    if (future.wait_for(20s) != std::future_status::ready) {
-        ADD_FAILURE() << "no completion for " << request.url();
-        return HttpResult{std::nullopt, "test timed out"};
-    }
-    return future.get();
+    return test::await<HttpResult>([&](auto done) { client.send(request, done); });
 }
 
 TEST(CurlHttpClientTest, RunsTransfersConcurrentlyAndCompletesEachOnceOnTheSessionThread) {

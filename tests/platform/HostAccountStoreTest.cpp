@@ -11,6 +11,7 @@
 #include "core/AsioDispatcher.h"
 #include "core/JsonCodec.h"
 #include "core/PlistCodec.h"
+#include "fakes/Await.h"
 #include "fakes/FakeServices.h"
 #include "fakes/TestHttpsServer.h"
 #include "fakes/TestPlatform.h"
@@ -50,18 +51,12 @@ struct Renewal {
 };
 
 Renewal renew(AccountStore& store, const Account& kf) {
-    auto promise = std::make_shared<std::promise<Renewal>>();
-    auto future = promise->get_future();
-    CredentialRenewalOptions options{true, {kService}};
-    store.renewCredentialsForAccount(
-        kf, options, [promise](long code, std::optional<std::string> error) {
-            promise->set_value({code, error, std::this_thread::get_id()});
-        });
-    if (future.wait_for(20s) != std::future_status::ready) {
-        ADD_FAILURE() << "renewal never completed";
-        return {};
-    }
-    return future.get();
+    return test::await<Renewal>([&](auto done) {
+        store.renewCredentialsForAccount(kf, {true, {kService}},
+                                         [done](long code, std::optional<std::string> error) {
+                                             done({code, error, std::this_thread::get_id()});
+                                         });
+    });
 }
 
 class HostAccountStoreTest : public ::testing::Test {

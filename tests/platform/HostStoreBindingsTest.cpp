@@ -3,12 +3,11 @@
 // Good answers are checked against coverage-sim (CoverageSimScenarioTest).
 #include <gtest/gtest.h>
 
-#include <chrono>
-#include <future>
 #include <thread>
 
 #include "core/AsioDispatcher.h"
 #include "core/PlistCodec.h"
+#include "fakes/Await.h"
 #include "fakes/TestHttpsServer.h"
 #include "fakes/TestPlatform.h"
 #include "platform/host/CurlHttpClient.h"
@@ -17,8 +16,6 @@
 
 namespace qax {
 namespace {
-
-using namespace std::chrono_literals;
 
 template <typename Record>
 struct Answer {
@@ -29,16 +26,11 @@ struct Answer {
 
 template <typename Record, typename Ask>
 Answer<Record> wait(Ask ask) {
-    auto promise = std::make_shared<std::promise<Answer<Record>>>();
-    auto future = promise->get_future();
-    ask([promise](std::vector<Record> records, std::optional<std::string> error) {
-        promise->set_value({std::move(records), std::move(error), std::this_thread::get_id()});
+    return test::await<Answer<Record>>([&](auto done) {
+        ask([done](std::vector<Record> records, std::optional<std::string> error) {
+            done({std::move(records), std::move(error), std::this_thread::get_id()});
+        });
     });
-    if (future.wait_for(20s) != std::future_status::ready) {
-        ADD_FAILURE() << "no completion";
-        return {};
-    }
-    return future.get();
 }
 
 TEST(HostStoreBindings, FailuresCompleteOnceWithAReason) {

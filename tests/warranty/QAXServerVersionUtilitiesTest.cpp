@@ -2,12 +2,10 @@
 
 #include <gtest/gtest.h>
 
-#include <atomic>
-#include <chrono>
-#include <future>
 #include <mutex>
 
 #include "core/PlistCodec.h"
+#include "fakes/Await.h"
 #include "fakes/TestHttpsServer.h"
 #include "fakes/TestPlatform.h"
 #include "platform/PreferenceStore.h"
@@ -17,7 +15,7 @@
 namespace qax {
 namespace {
 
-using namespace std::chrono_literals;
+using test::await;
 
 constexpr const char* kListPath = "/library/VELMORA/asset/qaxV2.plist";
 constexpr const char* kCache = "ServerVersionCache";
@@ -65,18 +63,6 @@ class QAXServerVersionUtilitiesTest : public ::testing::Test {
         return hits_;
     }
 
-    // Waits for a completion that may run on the HTTP session's thread.
-    template <typename T, typename Start>
-    static T await(Start start) {
-        auto promise = std::make_shared<std::promise<T>>();
-        auto future = promise->get_future();
-        start([promise](T value) { promise->set_value(std::move(value)); });
-        if (future.wait_for(20s) != std::future_status::ready) {
-            ADD_FAILURE() << "the completion was not called";
-            return T{};
-        }
-        return future.get();
-    }
     std::optional<QAXVersionSet> negotiate(QAXServerLookupPolicy policy) {
         return await<std::optional<QAXVersionSet>>([&](auto done) {
             QAXServerVersionUtilities::_supportedVersionsForClientAndServer(*tp.platform, policy,
