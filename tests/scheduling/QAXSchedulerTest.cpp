@@ -75,15 +75,15 @@ TEST_F(QAXSchedulerTest, DelayIsClampedAndTruncatedToWholeSeconds) {
         auto scheduler = make(std::make_shared<RecordingActivity>(network));
         scheduler->scheduleActivityWithDelay(row.delay);
 
-        auto criteria = activity()->criteria();
+        auto criteria = activity()->told().criteria;
         ASSERT_TRUE(criteria);
         EXPECT_EQ(criteria->delaySeconds, row.delaySeconds);
         EXPECT_EQ(criteria->gracePeriodSeconds, row.grace);
         EXPECT_EQ(criteria->requiresNetwork, network);
         EXPECT_TRUE(criteria->priorityUtility);
-        EXPECT_FALSE(activity()->preregistered());
-        EXPECT_FALSE(activity()->repeats());
-        EXPECT_EQ(activity()->qualityOfService(), QualityOfService::Background);
+        EXPECT_FALSE(activity()->told().preregistered);
+        EXPECT_FALSE(activity()->told().repeats);
+        EXPECT_EQ(activity()->told().qualityOfService, QualityOfService::Background);
         EXPECT_TRUE(activity()->armed());
 
         const Date now = tp.clock->now();
@@ -97,20 +97,20 @@ TEST_F(QAXSchedulerTest, ScheduleForDateSetsOrRemovesTheTarget) {
     const Date past = tp.clock->now().byAdding(-86400);
     scheduler->scheduleActivityForDate(past);
     EXPECT_EQ(scheduler->scheduledActivityDate(), past);
-    EXPECT_EQ(activity()->criteria()->delaySeconds, 0);
+    EXPECT_EQ(activity()->told().criteria->delaySeconds, 0);
     EXPECT_TRUE(
         tp.log->contains("scheduled 'com.velmora.qaxagent.outreach' with delay: "
                          "-86400.00 (" +
                          past.description() + ")"));
 
     scheduler->scheduleActivityForDate(tp.clock->now().byAdding(90.5));
-    EXPECT_EQ(activity()->criteria()->delaySeconds, 90);
-    EXPECT_EQ(activity()->criteria()->gracePeriodSeconds, 9);
+    EXPECT_EQ(activity()->told().criteria->delaySeconds, 90);
+    EXPECT_EQ(activity()->told().criteria->gracePeriodSeconds, 9);
 
     // No date: run at the first opportunity and leave no target behind.
     scheduler->scheduleActivityForDate(std::nullopt);
     EXPECT_FALSE(hasTarget());
-    EXPECT_EQ(activity()->criteria()->delaySeconds, 0);
+    EXPECT_EQ(activity()->told().criteria->delaySeconds, 0);
     EXPECT_TRUE(
         tp.log->contains("scheduled 'com.velmora.qaxagent.outreach' with delay: 0.00 ((null))"));
 }
@@ -169,7 +169,7 @@ TEST_F(QAXSchedulerTest, FiringDecidesByTheStoredTarget) {
 TEST_F(QAXSchedulerTest, MonitoringAttachesToThePreregisteredActivity) {
     auto scheduler = make(delegate);
     scheduler->monitorForScheduledActivity();
-    EXPECT_TRUE(activity()->preregistered());
+    EXPECT_TRUE(activity()->told().preregistered);
 
     // A wake-up of the pre-registered activity with a target still in the future defers.
     tp.platform->preferences->setObject(QAXScheduler::targetDateKey(kIdentifier),
@@ -192,7 +192,7 @@ TEST_F(QAXSchedulerTest, RunThatReschedulesItselfAndFinishesLosesTheNewTarget) {
     };
     activity()->fire();
     ASSERT_TRUE(hasTarget());
-    EXPECT_EQ(activity()->criteria()->delaySeconds, 3600);
+    EXPECT_EQ(activity()->told().criteria->delaySeconds, 3600);
 
     delegate->duringRun = nullptr;
     delegate->pending(QAXActivityResultFinished);
