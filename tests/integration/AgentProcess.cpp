@@ -37,6 +37,17 @@ void AgentProcess::writeDevices(const std::string& serialNumber,
                   Value::Dictionary{{"Kestova", Value::Dictionary{{"Tessel_3_0", true}}}});
 }
 
+void AgentProcess::writeAccounts(const std::optional<std::string>& tokenServiceURL,
+                                 const Value::Dictionary& tokens) {
+    Value::Dictionary accounts{{"PrimaryCloudAccount", Value::Dictionary{{"altDSID", "primary"}}}};
+    if (tokenServiceURL) {
+        accounts["KFAccount"] = Value::Dictionary{
+            {"altDSID", "kf"}, {"TokenServiceURL", *tokenServiceURL}, {"Tokens", tokens}};
+        accounts["StoreAccount"] = Value::Dictionary{{"storefront", "143441-1,29"}};
+    }
+    writeRootFile("accounts.plist", accounts);
+}
+
 void AgentProcess::registerApplication(const std::string& name, const std::string& executablePath,
                                        std::optional<std::string> bundleIdentifier,
                                        std::optional<Value> entitlement) {
@@ -60,6 +71,10 @@ std::vector<std::string> AgentProcess::environment() const {
                                     std::string("PATH=") + (path ? path : "/usr/bin:/bin")};
     env.insert(env.end(), extraEnvironment.begin(), extraEnvironment.end());
     return env;
+}
+
+ToolResult AgentProcess::ctl(const std::vector<std::string>& args) const {
+    return runTool(QAX_CTL_BINARY, args, environment());
 }
 
 bool AgentProcess::start(const std::string& program) {

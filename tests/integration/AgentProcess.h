@@ -16,6 +16,12 @@
 
 namespace qax::test {
 
+struct ToolResult {
+    int status = -1;  // the exit status; -1 when killed by a signal or at the deadline
+    std::string out;
+    std::string err;
+};
+
 class AgentProcess {
   public:
     AgentProcess();
@@ -33,6 +39,10 @@ class AgentProcess {
     // paired-watches feature on.
     void writeDevices(const std::string& serialNumber,
                       const std::optional<std::string>& watchSerialNumber = std::nullopt);
+    // A signed-in user; with a token service, also a KF account (with `tokens`, service ->
+    // token) renewed there and a store account.
+    void writeAccounts(const std::optional<std::string>& tokenServiceURL = std::nullopt,
+                       const Value::Dictionary& tokens = {});
     // Registers an executable in the application registry under `name`; an entitlement value of
     // none leaves the entitlement out.
     void registerApplication(const std::string& name, const std::string& executablePath,
@@ -53,6 +63,9 @@ class AgentProcess {
     // Polls the log until `text` has appeared `times` times.
     bool waitForLog(const std::string& text, int times = 1, double seconds = 5) const;
 
+    // Runs qaxctl with this environment.
+    ToolResult ctl(const std::vector<std::string>& args) const;
+
     // The environment the agent runs with (HOME, QAX_PLATFORM_ROOT, QAX_RUNTIME_DIR, PATH, and
     // the extra entries).
     std::vector<std::string> environment() const;
@@ -62,12 +75,6 @@ class AgentProcess {
   private:
     TempDir dir_;
     std::unique_ptr<SpawnedProcess> process_;
-};
-
-struct ToolResult {
-    int status = -1;  // the exit status; -1 when killed by a signal or at the deadline
-    std::string out;
-    std::string err;
 };
 
 // Runs a program with `environment`, waiting at most `seconds`.

@@ -56,10 +56,6 @@ class AgentServiceTest : public ::testing::Test {
         return device ? device->serialNumber() : std::nullopt;
     }
 
-    test::ToolResult ctl(const std::vector<std::string>& args) {
-        return test::runTool(QAX_CTL_BINARY, args, agent.environment());
-    }
-
     test::AgentProcess agent;
 };
 
@@ -115,7 +111,7 @@ TEST_F(AgentServiceTest, EntitledClientsAreServedAndOthersClosed) {
         EXPECT_TRUE(agent.waitForLog(kRejected, ++rejections)) << what << "\n" << agent.log();
     }
     // A program the registry does not know at all.
-    auto unknown = ctl({"store-check", "com.velmora.support"});
+    auto unknown = agent.ctl({"store-check", "com.velmora.support"});
     EXPECT_EQ(unknown.status, 69);
     EXPECT_NE(unknown.err.find("the agent closed the connection"), std::string::npos)
         << unknown.err;
@@ -213,28 +209,28 @@ TEST_F(AgentServiceTest, QaxctlLaunchEventsASecondAgentAndACleanStop) {
                    Value(Value::Dictionary{{"LowServerVersion", Value(2)},
                                            {"HighServerVersion", Value(3)}}));
 
-    auto device = ctl({"default-device", "--json"});
+    auto device = agent.ctl({"default-device", "--json"});
     ASSERT_EQ(device.status, 0) << device.err;
     auto json = parseJson(device.out);
     ASSERT_TRUE(json) << device.out;
     EXPECT_EQ(*json->find("serialNumber"), Value("ITEST-SN-1"));
     EXPECT_EQ(*json->find("deviceTypeString"), Value("Default"));
     EXPECT_TRUE(agent.waitForLog("with calling process: com.velmora.Preferences"));
-    auto paired = ctl({"paired-devices", "--json"});
+    auto paired = agent.ctl({"paired-devices", "--json"});
     ASSERT_EQ(paired.status, 0) << paired.err;
     auto list = parseJson(paired.out);
     ASSERT_TRUE(list && list->isArray() && list->size() == 1) << paired.out;
     EXPECT_EQ(*(*list->asArray())[0].find("serialNumber"), Value("W1"));
     EXPECT_EQ(*(*list->asArray())[0].find("name"), Value("Morning"));
-    EXPECT_NE(ctl({"paired-devices"}).out.find("Morning  W1"), std::string::npos);
+    EXPECT_NE(agent.ctl({"paired-devices"}).out.find("Morning  W1"), std::string::npos);
 
     // An internal build reads the web URL override.
-    auto plain = ctl({"web-url-override"});
+    auto plain = agent.ctl({"web-url-override"});
     EXPECT_EQ(plain.status, 0) << plain.err;
     EXPECT_EQ(plain.out, "no web URL override\n");
     FilePreferenceStore(FilePreferenceStore::domainPath(agent.home()))
         .setObject("WebFlowURL", Value("https://flow.example/x"));
-    auto stored = ctl({"web-url-override", "--json"});
+    auto stored = agent.ctl({"web-url-override", "--json"});
     EXPECT_EQ(stored.status, 0) << stored.err;
     EXPECT_EQ(stored.out, "\"https://flow.example/x\"\n");
 
@@ -242,7 +238,7 @@ TEST_F(AgentServiceTest, QaxctlLaunchEventsASecondAgentAndACleanStop) {
                                              "com.velmora.pairlink.devicedidunpair"));
     EXPECT_TRUE(agent.waitForLog(
         "got launched with notificationName: com.velmora.pairlink.devicedidunpair"));
-    auto notified = ctl({"notify", "com.velmora.pairlink.devicedidpair"});
+    auto notified = agent.ctl({"notify", "com.velmora.pairlink.devicedidpair"});
     EXPECT_EQ(notified.status, 0) << notified.err;
     EXPECT_TRUE(
         agent.waitForLog("got launched with notificationName: com.velmora.pairlink.devicedidpair"));

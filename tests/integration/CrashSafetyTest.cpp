@@ -298,12 +298,8 @@ TEST(CrashSafety, WritersKilledAtRandomLeaveEveryStoreOldOrNewAndTheAgentServes)
         static_cast<long long>(next - 1));
 
     // The agent starts on what the writers left and serves the cached warranty.
-    agent.writeRootFile("device.plist", Value::Dictionary{{"SerialNumber", trial::kSerialNumber},
-                                                          {"ProductType", "Phone1,1"},
-                                                          {"ProductVersion", "1.0"}});
-    agent.writeRootFile(
-        "accounts.plist",
-        Value::Dictionary{{"PrimaryCloudAccount", Value::Dictionary{{"altDSID", "crash-trial"}}}});
+    agent.writeDevices(trial::kSerialNumber);
+    agent.writeAccounts();
     agent.registerApplication("tests", test::selfExecutable(), std::nullopt, Value(true));
     ASSERT_TRUE(agent.start()) << agent.log();
     HostIpcClient client;

@@ -44,11 +44,8 @@ Answers answersOf(const Value& reply) {
 TEST(DownloadThroughCoverageSim, PreviewedRequestsThenForcedDownloadThenCachedAnswers) {
     test::AgentProcess agent;
     const std::string root = agent.platformRoot();
-    auto ctl = [&](const std::vector<std::string>& args) {
-        return test::runTool(QAX_CTL_BINARY, args, agent.environment());
-    };
     agent.writeDevices(kPhone, kWatch);
-    auto refused = ctl({"request-preview", kPhone, "--json"});
+    auto refused = agent.ctl({"request-preview", kPhone, "--json"});
     EXPECT_EQ(refused.status, 1);
     EXPECT_TRUE(refused.out.empty()) << refused.out;
     EXPECT_NE(refused.err.find("No primary Skyvault account, can't sign this request"),
@@ -56,7 +53,7 @@ TEST(DownloadThroughCoverageSim, PreviewedRequestsThenForcedDownloadThenCachedAn
         << refused.err;
 
     // coverage-sim trusts only the root attestation-ca prints.
-    auto ca = ctl({"attestation-ca"});
+    auto ca = agent.ctl({"attestation-ca"});
     ASSERT_EQ(ca.status, 0) << ca.err;
     ASSERT_EQ(ca.out.rfind("-----BEGIN CERTIFICATE-----", 0), 0u) << ca.out;
     test::writeFile(agent.home() + "/printed-root.pem", ca.out);
@@ -64,23 +61,15 @@ TEST(DownloadThroughCoverageSim, PreviewedRequestsThenForcedDownloadThenCachedAn
         agent.home() + "/sim", root,
         std::vector<std::string>{"--attestation-root", agent.home() + "/printed-root.pem"});
     ASSERT_FALSE(sim->base().empty()) << "coverage-sim did not start";
-    auto writeAccounts = [&](Value::Dictionary tokens) {
-        agent.writeRootFile(
-            "accounts.plist",
-            Value::Dictionary{
-                {"PrimaryCloudAccount", Value::Dictionary{{"altDSID", "primary"}}},
-                {"KFAccount", Value::Dictionary{{"altDSID", "kf"},
-                                                {"TokenServiceURL", sim->base() + "/token"},
-                                                {"Tokens", tokens}}},
-                {"StoreAccount", Value::Dictionary{{"storefront", "143441-1,29"}}}});
-    };
-    writeAccounts({{"com.velmora.kf.supportapp.auth", "stored-token"}});
+    agent.writeAccounts(sim->base() + "/token",
+                        {{"com.velmora.kf.supportapp.auth", "stored-token"}});
     FilePreferenceStore preferences(FilePreferenceStore::domainPath(agent.home()));
     preferences.setObject("ServerVersionURL", sim->base() + "/library/VELMORA/asset/qaxV2.plist");
     preferences.setObject("WarrantyURL", sim->base() + "/api/v3/coverage/summary");
     preferences.setObject("WearablesWarrantyURL", sim->base() + "/api/v2/coverage/summary");
 
-    auto own = ctl({"request-preview", kPhone, "--bundle-id", "com.velmora.Preferences", "--json"});
+    auto own =
+        agent.ctl({"request-preview", kPhone, "--bundle-id", "com.velmora.Preferences", "--json"});
     ASSERT_EQ(own.status, 0) << own.err;
     auto printed = parseJson(own.out).value_or(Value());
     EXPECT_EQ(*printed.find("url"), Value(sim->base() + "/api/v3/coverage/summary"));
@@ -113,7 +102,7 @@ TEST(DownloadThroughCoverageSim, PreviewedRequestsThenForcedDownloadThenCachedAn
 
     // Another device's request goes to the wearables endpoint without attestation; a later
     // attempt renews the token first.
-    auto other = ctl({"request-preview", kWatch, "--attempt", "2", "--json"});
+    auto other = agent.ctl({"request-preview", kWatch, "--attempt", "2", "--json"});
     ASSERT_EQ(other.status, 0) << other.err;
     auto otherRequest = parseJson(other.out).value_or(Value());
     EXPECT_EQ(*otherRequest.find("url"), Value(sim->base() + "/api/v2/coverage/summary"));
@@ -122,10 +111,10 @@ TEST(DownloadThroughCoverageSim, PreviewedRequestsThenForcedDownloadThenCachedAn
     EXPECT_FALSE(otherHeaders.find("X-Velmora-Kva-S"));
     EXPECT_NE(*otherHeaders.find("X-Velmora-KF-Token"), Value("stored-token"));
     EXPECT_EQ(*otherHeaders.find("User-Agent"), Value("<com.velmora.qaxagent/1.0/Phone1,1>"));
-    EXPECT_EQ(ctl({"request-preview", kPhone, "--attempt", "3"}).status, 64);
+    EXPECT_EQ(agent.ctl({"request-preview", kPhone, "--attempt", "3"}).status, 64);
 
     // The agent starts without a token: it renews one itself.
-    writeAccounts({});
+    agent.writeAccounts(sim->base() + "/token");
     const std::size_t previewRequests = sim->requestLog().size();
     agent.registerApplication("tests", test::selfExecutable(), std::nullopt, Value(true));
     // The first start's outreach would download the same summaries in the background, with

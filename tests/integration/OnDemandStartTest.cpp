@@ -91,9 +91,7 @@ TEST(OnDemandStartTest, IdleExitAndTheNextInstanceKeepStateAndALateClient) {
         EXPECT_EQ(receiveNotice(notices), "READY=1\nSTATUS=Serving clients");
         std::this_thread::sleep_for(std::chrono::milliseconds(1500));
         EXPECT_TRUE(first->running()) << "a connected client keeps the agent past its idle time";
-        auto written = test::runTool(QAX_CTL_BINARY,
-                                     {"defaults", "write", "SerialNumber", "-string", "OD-KEPT"},
-                                     agent.environment());
+        auto written = agent.ctl({"defaults", "write", "SerialNumber", "-string", "OD-KEPT"});
         ASSERT_EQ(written.status, 0) << written.err;
         EXPECT_EQ(defaultSerial(client), "OD-KEPT");
     }
@@ -154,9 +152,7 @@ TEST(OnDemandStartTest, UnderSystemdSocketActivateTheFirstConnectionStartsIt) {
             << "nothing starts the agent before a client";
         EXPECT_EQ(defaultSerial(), instance == 1 ? "OD-2" : "OD-KEPT") << agent.log();
         if (instance == 1) {
-            auto written = test::runTool(
-                QAX_CTL_BINARY, {"defaults", "write", "SerialNumber", "-string", "OD-KEPT"},
-                agent.environment());
+            auto written = agent.ctl({"defaults", "write", "SerialNumber", "-string", "OD-KEPT"});
             ASSERT_EQ(written.status, 0) << written.err;
         }
         EXPECT_TRUE(exitedCleanly(activated.waitForExit(kWait))) << agent.log();

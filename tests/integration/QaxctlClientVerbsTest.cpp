@@ -77,16 +77,12 @@ Value summaryEndingIn(double seconds) {
 
 class QaxctlClientVerbsTest : public ::testing::Test {
   protected:
-    test::ToolResult run(const std::vector<std::string>& args) {
-        return test::runTool(QAX_CTL_BINARY, args, agent.environment());
-    }
-
     test::AgentProcess agent;  // its directories and environment; started only where needed
     test::TestPlatform tp;
 };
 
 TEST_F(QaxctlClientVerbsTest, EachVerbSendsItsRequestAndPrintsTheReply) {
-    auto absent = run({"device-info"});
+    auto absent = agent.ctl({"device-info"});
     EXPECT_EQ(absent.status, 69);
     EXPECT_NE(absent.err.find("is qaxagent running?"), std::string::npos) << absent.err;
     for (const auto& args : std::vector<std::vector<std::string>>{
@@ -98,7 +94,7 @@ TEST_F(QaxctlClientVerbsTest, EachVerbSendsItsRequestAndPrintsTheReply) {
              {"account-added", "--timeout", "soon"},
              {"store-check", "--json"},
          }) {
-        auto result = run(args);
+        auto result = agent.ctl(args);
         EXPECT_EQ(result.status, 64) << args[0] << " " << result.err;
         EXPECT_EQ(result.err.rfind("usage: qaxctl " + args[0], 0), 0u) << result.err;
     }

@@ -85,9 +85,7 @@ class QaxctlExplainTest : public ::testing::Test {
                             Value(Value::Dictionary{{"SerialNumber", Value(kPhone)},
                                                     {"ProductType", Value("Phone14,2")},
                                                     {"ProductVersion", Value("17.2")}}));
-        agent.writeRootFile("accounts.plist",
-                            Value(Value::Dictionary{{"PrimaryCloudAccount",
-                                                     Value(Value::Dictionary{{"altDSID", "a"}})}}));
+        agent.writeAccounts();
         agent.writeRootFile("locale.plist",
                             Value(Value::Dictionary{{"PreferredLocale", Value("en_US")}}));
         // This boot and this system version are behind the agent already: its start-up runs
@@ -167,12 +165,10 @@ class QaxctlExplainTest : public ::testing::Test {
         platform->preferences->setObject(QAXScheduler::targetDateKey(kRefresh), Value(now));
     }
 
-    test::ToolResult ctl(const std::vector<std::string>& args) {
-        return test::runTool(QAX_CTL_BINARY, args, agent.environment());
-    }
     void advanceTo(Date date) {
         const double by = std::ceil(date.timeIntervalSince(platform->clock->now()));
-        ASSERT_EQ(ctl({"clock", "advance", std::to_string(static_cast<long long>(by))}).status, 0);
+        ASSERT_EQ(
+            agent.ctl({"clock", "advance", std::to_string(static_cast<long long>(by))}).status, 0);
         std::static_pointer_cast<SimulatedClock>(platform->clock)->reloadOffset();
     }
     // Runs explain and checks that it changed no file of the home and platform root.
@@ -180,11 +176,11 @@ class QaxctlExplainTest : public ::testing::Test {
         const auto before = fingerprint(agent.home());
         std::vector<std::string> args{"explain", "--json"};
         args.insert(args.end(), extra.begin(), extra.end());
-        auto r = ctl(args);
+        auto r = agent.ctl(args);
         EXPECT_EQ(r.status, 0) << r.err;
         EXPECT_EQ(fingerprint(agent.home()), before) << "explain changed a file";
         args.erase(args.begin() + 1);
-        auto text = ctl(args);
+        auto text = agent.ctl(args);
         EXPECT_EQ(text.status, 0) << text.err;
         EXPECT_EQ(fingerprint(agent.home()), before) << "explain changed a file";
         if (textOut) {
@@ -214,7 +210,7 @@ class QaxctlExplainTest : public ::testing::Test {
         return r == records.end() ? std::nullopt : r->second.dueDate;
     }
     Value followUp() {
-        auto list = parseJson(ctl({"followups", "--json"}).out);
+        auto list = parseJson(agent.ctl({"followups", "--json"}).out);
         return list && list->isArray() && list->asArray()->size() == 1 ? list->asArray()->front()
                                                                        : Value();
     }
@@ -367,7 +363,7 @@ TEST_F(QaxctlExplainTest, BadInputGetsAClearAnswer) {
     }
     for (const auto& bad :
          std::vector<std::vector<std::string>>{{"explain", "A", "B"}, {"explain", "--verbose"}}) {
-        EXPECT_EQ(ctl(bad).status, 64) << bad.back();
+        EXPECT_EQ(agent.ctl(bad).status, 64) << bad.back();
     }
 }
 
