@@ -149,6 +149,23 @@ TEST_F(QAXKVAManagerTest, HeadersCarryAVerifiableSignatureAndChain) {
     addKVAAuthenticationHeadersWithBody(request, *tp.platform, kBody);
     scripted->drain();
     ASSERT_TRUE(request.valueForHeader("X-Velmora-Kva-S"));
+    // What the attestation service was asked for.
+    ASSERT_EQ(scripted->calls().size(), 1u);
+    const AttestationOptions o = scripted->calls()[0];
+    EXPECT_EQ(o.keyStoreLabel, "com.velmora.qaxagent.kvaCertificates");
+    EXPECT_EQ(o.keyStoreAccessGroup, "com.velmora.qaxagent");
+    EXPECT_TRUE(o.includeCACertificate);
+    EXPECT_EQ(o.networkTimeoutInterval, 60);
+    EXPECT_FALSE(o.svxtAttestation);
+    EXPECT_EQ(o.validity, 43200);
+    ASSERT_TRUE(o.accessControls);
+    EXPECT_EQ(o.accessControls->accessibility, KeyAccessibility::AfterFirstUnlockThisDeviceOnly);
+    EXPECT_TRUE(o.accessControls->privateKeyUsageOnly);
+    EXPECT_EQ(o.oidsToInclude,
+              (std::vector<AttestationOID>{
+                  AttestationOID::UVXTDeviceIdentifiers, AttestationOID::DeviceIdentifiers,
+                  AttestationOID::HardwareProperties, AttestationOID::AccessControls,
+                  AttestationOID::DeviceOSInformation}));
     auto chain = chainFromHeader(request);
     ASSERT_EQ(chain.size(), 2u);
     ASSERT_TRUE(chain[0] && chain[1]);
@@ -198,29 +215,6 @@ TEST_F(QAXKVAManagerTest, HeadersCarryAVerifiableSignatureAndChain) {
     EXPECT_EQ(EVP_PKEY_eq(X509_get0_pubkey(chain[0].get()), X509_get0_pubkey(chain2[0].get())), 1);
     EXPECT_TRUE(
         signatureVerifies(chain[0].get(), *again.valueForHeader("X-Velmora-Kva-S"), "other body"));
-}
-
-TEST_F(QAXKVAManagerTest, IssuanceOptions) {
-    auto manager = QAXKVAManager::create(scripted);
-    ASSERT_TRUE(manager->generateKVACertficate({}));
-    scripted->drain();
-    auto calls = scripted->calls();
-    ASSERT_EQ(calls.size(), 1u);
-    const auto& o = calls[0];
-    EXPECT_EQ(o.keyStoreLabel, "com.velmora.qaxagent.kvaCertificates");
-    EXPECT_EQ(o.keyStoreAccessGroup, "com.velmora.qaxagent");
-    EXPECT_TRUE(o.includeCACertificate);
-    EXPECT_EQ(o.networkTimeoutInterval, 60);
-    EXPECT_FALSE(o.svxtAttestation);
-    EXPECT_EQ(o.validity, 43200);
-    ASSERT_TRUE(o.accessControls);
-    EXPECT_EQ(o.accessControls->accessibility, KeyAccessibility::AfterFirstUnlockThisDeviceOnly);
-    EXPECT_TRUE(o.accessControls->privateKeyUsageOnly);
-    EXPECT_EQ(o.oidsToInclude,
-              (std::vector<AttestationOID>{
-                  AttestationOID::UVXTDeviceIdentifiers, AttestationOID::DeviceIdentifiers,
-                  AttestationOID::HardwareProperties, AttestationOID::AccessControls,
-                  AttestationOID::DeviceOSInformation}));
 }
 
 TEST_F(QAXKVAManagerTest, IssuanceOutcomes) {
@@ -430,12 +424,6 @@ TEST(HostAttestationServiceTest, PlatformFileControlsSupportAndFirstIssuance) {
                                  tp.clock);
     EXPECT_EQ(again.rootCertificatePEM(nullptr), first);
 }
-
-}  // namespace
-}  // namespace qax
-
-namespace qax {
-namespace {
 
 TEST(HostAttestationServiceTest, LastReferenceDroppedOnItsOwnThread) {
     test::TestPlatform tp;
