@@ -11,6 +11,7 @@
 #include <thread>
 #include <vector>
 
+#include "core/VirtualTimeTaskRunner.h"
 #include "fakes/Await.h"
 #include "fakes/FakeServices.h"
 #include "fakes/TestHttpsServer.h"
@@ -105,24 +106,13 @@ TEST(CurlHttpClientTest, RunsTransfersConcurrentlyAndCompletesEachOnceOnTheSessi
 }
 
 TEST(CurlHttpClientTest, CompletionsRunOnTheCompletionQueueWhenOneIsGiven) {
-    // Holds what is posted until the test runs it.
-    struct HeldQueue : TaskRunner {
-        std::mutex mutex;
-        std::condition_variable posted;
-        std::vector<Task> tasks;
-        void post(Task task) override {
-            std::lock_guard<std::mutex> lock(mutex);
-            tasks.push_back(std::move(task));
-            posted.notify_all();
-        }
-        void postDelayed(Task task, double) override { post(std::move(task)); }
-    };
     TestHttpsServer server;
     server.server().Get("/ok", [](const httplib::Request&, httplib::Response& res) {
         res.set_content("ok", "text/plain");
     });
     server.start();
-    auto queue = std::make_shared<HeldQueue>();
+    // Holds what is posted until the test runs it.
+    auto queue = std::make_shared<VirtualTimeTaskRunner>(std::make_shared<ManualClock>());
     auto options = trusting(server);
     options.completionQueue = queue;
     CurlHttpClient client(options);
@@ -133,16 +123,12 @@ TEST(CurlHttpClientTest, CompletionsRunOnTheCompletionQueueWhenOneIsGiven) {
         body = r.response ? r.response->body : r.error;
         ++completions;
     });
-    std::vector<Task> tasks;
-    {
-        std::unique_lock<std::mutex> lock(queue->mutex);
-        ASSERT_TRUE(queue->posted.wait_for(lock, 20s, [&] { return !queue->tasks.empty(); }));
-        tasks.swap(queue->tasks);
+    for (int i = 0; i < 4000 && queue->pendingCount() == 0; ++i) {
+        std::this_thread::sleep_for(5ms);
     }
+    ASSERT_EQ(queue->pendingCount(), 1u);
     EXPECT_EQ(completions, 0);
-    for (auto& task : tasks) {
-        task();
-    }
+    queue->runUntilIdle();
     EXPECT_EQ(completions, 1);
     EXPECT_EQ(body, "ok");
 }
