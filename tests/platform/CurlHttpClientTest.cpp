@@ -107,9 +107,7 @@ TEST(CurlHttpClientTest, RunsTransfersConcurrentlyAndCompletesEachOnceOnTheSessi
 
 TEST(CurlHttpClientTest, CompletionsRunOnTheCompletionQueueWhenOneIsGiven) {
     TestHttpsServer server;
-    server.server().Get("/ok", [](const httplib::Request&, httplib::Response& res) {
-        res.set_content("ok", "text/plain");
-    });
+    server.answer("/ok", {200, "ok", "text/plain"});
     server.start();
     // Holds what is posted until the test runs it.
     auto queue = std::make_shared<VirtualTimeTaskRunner>(std::make_shared<ManualClock>());
@@ -136,9 +134,7 @@ TEST(CurlHttpClientTest, CompletionsRunOnTheCompletionQueueWhenOneIsGiven) {
 TEST(CurlHttpClientTest, TransportFailuresComeBackAsErrors) {
     Gate gate;  // outlives the server's handler threads
     TestHttpsServer server;
-    server.server().Get("/ok", [](const httplib::Request&, httplib::Response& res) {
-        res.set_content("ok", "text/plain");
-    });
+    server.answer("/ok", {200, "ok", "text/plain"});
     server.server().Get("/slow", [&gate](const httplib::Request&, httplib::Response& res) {
         gate.arrive();
         gate.waitForRelease();
@@ -241,9 +237,7 @@ TEST(CurlHttpClientTest, DestructionCompletesOutstandingTransfersWithAnError) {
         gate.waitForRelease();
         res.set_content("too late", "text/plain");
     });
-    server.server().Get("/ok", [](const httplib::Request&, httplib::Response& res) {
-        res.set_content("ok", "text/plain");
-    });
+    server.answer("/ok", {200, "ok", "text/plain"});
     server.start();
 
     std::atomic<int> calls{0}, errors{0};

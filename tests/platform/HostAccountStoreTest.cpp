@@ -156,17 +156,10 @@ TEST_F(HostAccountStoreTest, RenewalWithoutTokenServiceMintsAndStoresAToken) {
 }
 
 TEST_F(HostAccountStoreTest, SigningRenewsThroughTheTokenService) {
-    // The handler's state is declared before the server so that it outlives the server's threads.
-    std::mutex mutex;
-    std::vector<std::string> bodies;
-    int calls = 0;
     test::TestHttpsServer server;
-    server.server().Post("/token", [&](const httplib::Request& req, httplib::Response& res) {
-        std::lock_guard lock(mutex);
-        bodies.push_back(req.body);
-        res.set_content(R"({"token":"server-token-)" + std::to_string(++calls) + "\"}",
-                        "application/json");
-    });
+    server.answer("/token", {});
+    server.queue("/token",
+                 {{200, R"({"token":"server-token-1"})"}, {200, R"({"token":"server-token-2"})"}});
     server.start();
     CurlHttpClient::Options options;
     options.extraCAFile = server.caFile();
@@ -182,13 +175,10 @@ TEST_F(HostAccountStoreTest, SigningRenewsThroughTheTokenService) {
     ASSERT_TRUE(qax_signWithAccountHeaders(request, *tp.platform, false, true, "com.example.app"));
     EXPECT_EQ(request.valueForHeader("X-Velmora-KF-Token"), "server-token-1");
     EXPECT_EQ(storedToken(), "server-token-1");
-    {
-        std::lock_guard lock(mutex);
-        ASSERT_EQ(bodies.size(), 1u);
-        EXPECT_EQ(parseJson(bodies[0]),
-                  Value(Value::Dictionary{{"altDSID", "kf-alt"},
-                                          {"services", Value(Value::Array{kService})}}));
-    }
+    ASSERT_EQ(server.requests().size(), 1u);
+    EXPECT_EQ(
+        parseJson(server.requests()[0].body),
+        Value(Value::Dictionary{{"altDSID", "kf-alt"}, {"services", Value::Array{kService}}}));
     // A stored token needs no renewal unless forced.
     HttpRequest second("https://coverage.example/");
     ASSERT_TRUE(qax_signWithAccountHeaders(second, *tp.platform, false, true, "com.example.app"));
@@ -215,14 +205,9 @@ TEST_F(HostAccountStoreTest, SigningRenewsThroughTheTokenService) {
 
 TEST_F(HostAccountStoreTest, TokenServiceFailures) {
     test::TestHttpsServer server;
-    server.server().Post("/error",
-                         [](const httplib::Request&, httplib::Response& res) { res.status = 503; });
-    server.server().Post("/garbage", [](const httplib::Request&, httplib::Response& res) {
-        res.set_content("<html/>", "text/html");
-    });
-    server.server().Post("/empty", [](const httplib::Request&, httplib::Response& res) {
-        res.set_content(R"({"token":""})", "application/json");
-    });
+    server.answer("/error", {503});
+    server.answer("/garbage", {200, "<html/>", "text/html"});
+    server.answer("/empty", {200, R"({"token":""})"});
     server.start();
     CurlHttpClient::Options options;
     options.extraCAFile = server.caFile();

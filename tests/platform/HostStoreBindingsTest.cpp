@@ -35,19 +35,14 @@ Answer<Record> wait(Ask ask) {
 
 TEST(HostStoreBindings, FailuresCompleteOnceWithAReason) {
     test::TestHttpsServer server;
-    auto answer = [&](const char* path, int status, std::string body) {
-        server.server().Get(path, [status, body](const httplib::Request&, httplib::Response& res) {
-            res.status = status;
-            res.set_content(body, "application/json");
-        });
-    };
-    answer("/empty", 200, R"({"results":[],"purchases":[]})");
-    answer("/status", 503, R"({"results":[],"purchases":[]})");
-    answer("/garbage", 200, "<html>nope</html>");
-    answer("/object", 200, R"({"results":{},"purchases":"none"})");
-    answer("/array", 200, R"([{"results":[]}])");
-    answer("/bad-item", 200, R"({"results":[5],"purchases":[7]})");
-    answer("/bad-field", 200, R"({"results":[{"artworkURLs":"x"}],"purchases":[{"title":5}]})");
+    server.answer("/empty", {200, R"({"results":[],"purchases":[]})"});
+    server.answer("/status", {503, R"({"results":[],"purchases":[]})"});
+    server.answer("/garbage", {200, "<html>nope</html>"});
+    server.answer("/object", {200, R"({"results":{},"purchases":"none"})"});
+    server.answer("/array", {200, R"([{"results":[]}])"});
+    server.answer("/bad-item", {200, R"({"results":[5],"purchases":[7]})"});
+    server.answer("/bad-field",
+                  {200, R"({"results":[{"artworkURLs":"x"}],"purchases":[{"title":5}]})"});
     server.start();
     CurlHttpClient::Options options;
     options.extraCAFile = server.caFile();

@@ -2,8 +2,6 @@
 
 #include <gtest/gtest.h>
 
-#include <mutex>
-
 #include "core/PlistCodec.h"
 #include "fakes/Await.h"
 #include "fakes/TestHttpsServer.h"
@@ -34,14 +32,7 @@ Value versionList(Value low, Value high) {
 class QAXServerVersionUtilitiesTest : public ::testing::Test {
   protected:
     QAXServerVersionUtilitiesTest() {
-        server.server().Get(kListPath, [this](const httplib::Request&, httplib::Response& res) {
-            std::lock_guard<std::mutex> lock(mutex_);
-            ++hits_;
-            if (!cacheControl_.empty()) {
-                res.set_header("Cache-Control", cacheControl_);
-            }
-            res.set_content(body_, "application/x-plist");
-        });
+        server.answer(kListPath, {});
         server.start();
         server.trustIn(tp.platform->platformRoot);
         tp.platform->http = std::make_shared<CurlHttpClient>(
@@ -53,15 +44,14 @@ class QAXServerVersionUtilitiesTest : public ::testing::Test {
     PreferenceStore& preferences() { return *tp.platform->preferences; }
 
     void serve(const std::string& body, const std::string& cacheControl = "") {
-        std::lock_guard<std::mutex> lock(mutex_);
-        body_ = body;
-        cacheControl_ = cacheControl;
+        httplib::Headers headers;
+        if (!cacheControl.empty()) {
+            headers.emplace("Cache-Control", cacheControl);
+        }
+        server.setAnswer(kListPath, {200, body, "application/x-plist", headers});
     }
     void serveList(const Value& list) { serve(*toXmlPlist(list)); }
-    int hits() {
-        std::lock_guard<std::mutex> lock(mutex_);
-        return hits_;
-    }
+    int hits() { return static_cast<int>(server.requests().size()); }
 
     std::optional<QAXVersionSet> negotiate(QAXServerLookupPolicy policy) {
         return await<std::optional<QAXVersionSet>>([&](auto done) {
@@ -82,14 +72,6 @@ class QAXServerVersionUtilitiesTest : public ::testing::Test {
     }
     std::optional<Value> cache() { return preferences().objectForKey(kCache); }
 
-  private:
-    // What the server serves: declared before the server so that it outlives its threads.
-    std::mutex mutex_;
-    std::string body_;
-    std::string cacheControl_;
-    int hits_ = 0;
-
-  protected:
     test::TestHttpsServer server;  // outlives the platform's HTTP session
     test::TestPlatform tp;
 };

@@ -5,7 +5,6 @@
 #include <gtest/gtest.h>
 
 #include <deque>
-#include <mutex>
 #include <tuple>
 
 #include "core/AsioDispatcher.h"
@@ -40,41 +39,17 @@ Value versionList(int low, int high) {
 
 class QAXWarrantyDownloaderTest : public ::testing::Test {
   protected:
-    struct Answer {
-        int status = 200;
-        std::string body;
-    };
-    struct Received {
-        std::string path;
-        httplib::Headers headers;
-        std::string body;
-    };
+    using Answer = test::TestHttpsServer::Answer;
     struct Result {
         bool success = false;
         std::shared_ptr<QAXWarranty> warranty;
     };
 
     QAXWarrantyDownloaderTest() {
-        server.server().Get(kListPath, [this](const httplib::Request&, httplib::Response& res) {
-            std::lock_guard lock(mutex_);
-            if (listStatus_ != 200) {
-                res.status = listStatus_;
-                return;
-            }
-            res.set_content(*toXmlPlist(list_), "application/x-plist");
-        });
-        for (const char* path : {kPhonePath, kWearablePath}) {
-            server.server().Post(path, [this](const httplib::Request& req, httplib::Response& res) {
-                std::lock_guard lock(mutex_);
-                received_.push_back({req.path, req.headers, req.body});
-                Answer answer = answers_.empty() ? Answer{200, summaryText_} : answers_.front();
-                if (!answers_.empty()) {
-                    answers_.pop_front();
-                }
-                res.status = answer.status;
-                res.set_content(answer.body, "application/json");
-            });
-        }
+        server.answer(kListPath, {});
+        serveList(versionList(2, 3));
+        server.answer(kPhonePath, {200, summaryText_});
+        server.answer(kWearablePath, {200, summaryText_});
         server.start();
         server.trustIn(tp.platform->platformRoot);
 
@@ -100,18 +75,17 @@ class QAXWarrantyDownloaderTest : public ::testing::Test {
         return static_cast<test::FakeAgentFactory&>(*tp.platform->agentFactory);
     }
 
-    void script(std::deque<Answer> answers) {
-        std::lock_guard lock(mutex_);
-        answers_ = std::move(answers);
-    }
+    // The answers to this device's next summary requests.
+    void script(std::deque<Answer> answers) { server.queue(kPhonePath, std::move(answers)); }
     void serveList(Value list, int status = 200) {
-        std::lock_guard lock(mutex_);
-        list_ = std::move(list);
-        listStatus_ = status;
+        server.setAnswer(kListPath,
+                         {status, status == 200 ? *toXmlPlist(list) : "", "application/x-plist"});
     }
-    std::vector<Received> received() {
-        std::lock_guard lock(mutex_);
-        return received_;
+    // The summary requests.
+    std::vector<test::TestHttpsServer::Request> received() {
+        auto all = server.requests();
+        std::erase_if(all, [](const auto& r) { return r.method != "POST"; });
+        return all;
     }
 
     Result download(const std::string& serial) {
@@ -148,14 +122,6 @@ class QAXWarrantyDownloaderTest : public ::testing::Test {
         prefs().setObject(h + "_CachedWarrantyVersion", "1");
         return cacheState(serial);
     }
-
-  private:
-    // What the server serves: declared before the server so that it outlives its threads.
-    std::mutex mutex_;
-    Value list_ = versionList(2, 3);
-    int listStatus_ = 200;
-    std::deque<Answer> answers_;
-    std::vector<Received> received_;
 
   protected:
     const Value summary{Value::Dictionary{{"covered", true}, {"coverageLocalizedLabel", "Cov"}}};
