@@ -59,7 +59,7 @@ class AgentServiceTest : public ::testing::Test {
     test::AgentProcess agent;
 };
 
-TEST_F(AgentServiceTest, EntitledClientsAreServedAndOthersClosed) {
+TEST_F(AgentServiceTest, EntitledClientsAreServedOthersClosedAndBrokenSendersAlone) {
     auto client = connect();
     std::string error;
     auto reply = client->call("defaultDevice:", {}, kWait, &error);
@@ -119,9 +119,8 @@ TEST_F(AgentServiceTest, EntitledClientsAreServedAndOthersClosed) {
     entitle(Value(1));
     EXPECT_EQ(defaultSerial(*connect()), "ITEST-SN-1");
     EXPECT_EQ(defaultSerial(*client), "ITEST-SN-1") << "the first client is still served";
-}
 
-TEST_F(AgentServiceTest, BrokenFramesAndBadRequestsHarmOnlyTheirSender) {
+    // Broken frames and bad requests harm only their sender.
     auto bytes = [](std::initializer_list<unsigned char> b) {
         return std::string(b.begin(), b.end());
     };
@@ -139,11 +138,9 @@ TEST_F(AgentServiceTest, BrokenFramesAndBadRequestsHarmOnlyTheirSender) {
          *IpcFrameCodec::encode(Value(Value::Dictionary{{"op", Value("defaultDevice:")}}))},
         {"not a dictionary", *IpcFrameCodec::encode(Value(Value::Array{Value(1)}))},
     };
-    auto client = connect();
     int closures = 0;
     for (const auto& [what, frame] : broken) {
         auto bad = connect();
-        std::string error;
         ASSERT_TRUE(bad->sendRaw(frame, &error)) << what << ": " << error;
         EXPECT_TRUE(bad->waitForClose(kWait)) << what;
         EXPECT_TRUE(agent.waitForLog("Closing connection from pid", ++closures)) << what;
@@ -168,16 +165,15 @@ TEST_F(AgentServiceTest, BrokenFramesAndBadRequestsHarmOnlyTheirSender) {
     // Far more requests at once than the agent keeps in flight, one of them in XML: each is
     // answered once.
     constexpr int kRequests = 300;
-    std::string all = *IpcFrameCodec::frame(*toXmlPlist(Value(Value::Dictionary{
+    std::string frames = *IpcFrameCodec::frame(*toXmlPlist(Value(Value::Dictionary{
         {"id", Value(kRequests)}, {"op", Value("defaultDevice:")}, {"args", Value::Array{}}})));
     for (int id = 1; id < kRequests; ++id) {
-        all += *IpcFrameCodec::encode(
+        frames += *IpcFrameCodec::encode(
             Value(Value::Dictionary{{"id", Value(id)},
                                     {"op", Value(id % 2 ? "defaultDevice:" : "pairedDevices:")},
                                     {"args", Value(Value::Array{})}}));
     }
-    std::string error;
-    ASSERT_TRUE(client->sendRaw(all, &error)) << error;
+    ASSERT_TRUE(client->sendRaw(frames, &error)) << error;
     std::set<std::int64_t> ids;
     for (int i = 0; i < kRequests; ++i) {
         auto message = client->receive(kWait, &error);
