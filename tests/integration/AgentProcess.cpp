@@ -73,10 +73,6 @@ std::vector<std::string> AgentProcess::environment() const {
     return env;
 }
 
-ToolResult AgentProcess::ctl(const std::vector<std::string>& args) const {
-    return runTool(QAX_CTL_BINARY, args, environment());
-}
-
 bool AgentProcess::start(const std::string& program) {
     std::filesystem::remove(logPath());
     process_ = std::make_unique<SpawnedProcess>(program, std::vector<std::string>{}, environment(),

@@ -22,6 +22,10 @@ struct ToolResult {
     std::string err;
 };
 
+// Runs a program with `environment`, waiting at most `seconds`.
+ToolResult runTool(const std::string& program, const std::vector<std::string>& args,
+                   const std::vector<std::string>& environment, double seconds = 30);
+
 class AgentProcess {
   public:
     AgentProcess();
@@ -63,8 +67,12 @@ class AgentProcess {
     // Polls the log until `text` has appeared `times` times.
     bool waitForLog(const std::string& text, int times = 1, double seconds = 5) const;
 
-    // Runs qaxctl with this environment.
-    ToolResult ctl(const std::vector<std::string>& args) const;
+#ifdef QAX_CTL_BINARY
+    // Runs qaxctl with this environment (in the builds that name qaxctl).
+    ToolResult ctl(const std::vector<std::string>& args) const {
+        return runTool(QAX_CTL_BINARY, args, environment());
+    }
+#endif
 
     // The environment the agent runs with (HOME, QAX_PLATFORM_ROOT, QAX_RUNTIME_DIR, PATH, and
     // the extra entries).
@@ -76,10 +84,6 @@ class AgentProcess {
     TempDir dir_;
     std::unique_ptr<SpawnedProcess> process_;
 };
-
-// Runs a program with `environment`, waiting at most `seconds`.
-ToolResult runTool(const std::string& program, const std::vector<std::string>& args,
-                   const std::vector<std::string>& environment, double seconds = 30);
 
 // The real path of the running test executable.
 std::string selfExecutable();
