@@ -21,24 +21,7 @@ using test::FakeIdentityAccountManager;
 constexpr const char* kNoTokenAfterRenewal =
     "Error: still no KF token even after calling renewCredentialsForAccount.";
 
-class AccountHeadersTest : public ::testing::Test {
-  protected:
-    AccountHeadersTest() {
-        accounts = std::make_shared<FakeAccountStore>();
-        tp.platform->accounts = accounts;
-        tp.platform->identity = std::make_shared<FakeIdentityAccountManager>();
-    }
-
-    bool sign(bool force = false, std::optional<std::string> bundleID = "com.velmora.Preferences") {
-        return qax_signWithAccountHeaders(request, *tp.platform, force, true, bundleID);
-    }
-
-    test::TestPlatform tp;
-    std::shared_ptr<FakeAccountStore> accounts;
-    HttpRequest request{"https://coverage.example/api/v3/coverage/summary", 30};
-};
-
-// A platform of its own for one table row, signed in as the fake account store is.
+// A platform signed in as the fake account store is.
 struct Local {
     Local() {
         tp.platform->accounts = store;
@@ -46,7 +29,15 @@ struct Local {
     }
     test::TestPlatform tp;
     std::shared_ptr<FakeAccountStore> store = std::make_shared<FakeAccountStore>();
-    HttpRequest request{"https://coverage.example/"};
+    HttpRequest request{"https://coverage.example/api/v3/coverage/summary", 30};
+};
+
+class AccountHeadersTest : public ::testing::Test, protected Local {
+  protected:
+    bool sign(bool force = false, std::optional<std::string> bundleID = "com.velmora.Preferences") {
+        return qax_signWithAccountHeaders(request, *tp.platform, force, true, bundleID);
+    }
+    std::shared_ptr<FakeAccountStore>& accounts = store;
 };
 
 TEST_F(AccountHeadersTest, SignedRequestCarriesEveryHeaderInOrder) {
