@@ -23,7 +23,7 @@ class FilePreferenceStoreTest : public ::testing::Test {
     std::string path = FilePreferenceStore::domainPath(env.home.str());
 };
 
-TEST_F(FilePreferenceStoreTest, RegisteredDefaultStoredValueAndRemoval) {
+TEST_F(FilePreferenceStoreTest, RegisteredDefaultsStoredValuesRemovalAndTypedReads) {
     FilePreferenceStore store(path);
     qax_registerDefaults(store);
     const std::string registered = settings::kDefaultWarrantyURL;
@@ -41,11 +41,8 @@ TEST_F(FilePreferenceStoreTest, RegisteredDefaultStoredValueAndRemoval) {
     ASSERT_TRUE(onDisk);
     EXPECT_EQ(onDisk->find("WarrantyURL"), nullptr);
     EXPECT_EQ(onDisk->find("CachedWarrantyValidityDuration"), nullptr);
-}
 
-TEST_F(FilePreferenceStoreTest, TypedReadsOfAbsentAndPresentKeys) {
-    FilePreferenceStore store(path);
-    qax_registerDefaults(store);
+    // Typed reads of absent, registered and stored keys.
     EXPECT_FALSE(store.boolForKey("PostUpgradeActivityCompleted"));
     EXPECT_EQ(store.integerForKey("QAXMigrationVersion"), 0);
     EXPECT_EQ(store.doubleForKey("Nothing"), 0.0);
