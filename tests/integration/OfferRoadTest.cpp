@@ -10,7 +10,6 @@
 #include <chrono>
 #include <cmath>
 #include <filesystem>
-#include <future>
 #include <map>
 #include <regex>
 #include <thread>
@@ -19,7 +18,6 @@
 #include "CoverageSimProcess.h"
 #include "core/JsonCodec.h"
 #include "core/PlistCodec.h"
-#include "platform/host/CurlHttpClient.h"
 #include "platform/host/FilePreferenceStore.h"
 #include "platform/host/SystemClock.h"
 
@@ -151,15 +149,7 @@ class OfferRoadTest : public ::testing::Test {
 
     // Sets coverage-sim's scenario (a JSON object), or clears it without one.
     int scenario(std::optional<std::string> body) {
-        CurlHttpClient::Options options;
-        options.extraCAFile = sim->caFile();
-        CurlHttpClient http(options);
-        HttpRequest request(sim->base() + "/admin/scenario", 20);
-        request.setMethod(body ? "POST" : "DELETE");
-        request.setBody(std::move(body));
-        std::promise<HttpResult> done;
-        http.send(request, [&](HttpResult r) { done.set_value(std::move(r)); });
-        auto result = done.get_future().get();
+        auto result = sim->call(body ? "POST" : "DELETE", "/admin/scenario", std::move(body));
         return result.response ? static_cast<int>(result.response->statusCode) : 0;
     }
     // Every cache file of the agent and its bytes.
