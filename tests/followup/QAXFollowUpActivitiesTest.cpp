@@ -87,11 +87,10 @@ class FollowUpActivitiesTest : public ::testing::Test {
         tp.runner->runUntilIdle();
         return results;
     }
-    std::size_t items() {
-        return std::static_pointer_cast<test::InMemoryFollowUpCenter>(tp.platform->followUps)
-            ->items(kClient)
-            .size();
+    test::InMemoryFollowUpCenter& center() {
+        return static_cast<test::InMemoryFollowUpCenter&>(*tp.platform->followUps);
     }
+    std::size_t items() { return center().items(kClient).size(); }
 
     test::TestPlatform tp;
     PreferenceStore& prefs = *tp.platform->preferences;
@@ -189,22 +188,16 @@ TEST_F(FollowUpActivitiesTest, RunsPostRefreshAndScheduleWhatComesNext) {
         tp.log->clear();
         prefs.removeObject(QAXScheduler::targetDateKey(kPost));
         prefs.removeObject(QAXScheduler::targetDateKey(kRefresh));
-        std::static_pointer_cast<test::InMemoryFollowUpCenter>(tp.platform->followUps)
-            ->clearPendingFollowUpItemsWithUniqueIdentifiers(
-                kClient, {QAXFollowUp::uniqueIdentfierForSerialNumber(std::string("A"))}, nullptr);
+        center().setItems(kClient, {});
         if (!row.post) {
             QAXFollowUp(tp.platform).postFollowUpWithDeviceInfo(infos({shown})[0]);
         }
         agent->setInfos(row.reply ? infos(*row.reply) : QAXDeviceInfoList{});
         factory().setAgent(row.reply ? agent : nullptr);
 
-        std::shared_ptr<QAXSchedulerActivityDelegate> activity;
-        if (row.post) {
-            activity = std::make_shared<QAXFollowUpPost>(tp.platform);
-        } else {
-            activity = std::make_shared<QAXFollowUpRefresh>(tp.platform);
-        }
-        EXPECT_EQ(*run(activity), std::vector<std::int64_t>{row.result});
+        const auto results = row.post ? run(std::make_shared<QAXFollowUpPost>(tp.platform))
+                                      : run(std::make_shared<QAXFollowUpRefresh>(tp.platform));
+        EXPECT_EQ(*results, std::vector<std::int64_t>{row.result});
         EXPECT_EQ(items(), row.itemsAfter);
         EXPECT_EQ(target(kPost), at(row.nextPost));
         EXPECT_EQ(target(kRefresh), at(row.nextRefresh));
