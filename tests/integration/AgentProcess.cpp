@@ -20,10 +20,11 @@ void AgentProcess::writeRootFile(const std::string& relativePath, const Value& p
 }
 
 void AgentProcess::writeDevices(const std::string& serialNumber,
-                                const std::optional<std::string>& watchSerialNumber) {
+                                const std::optional<std::string>& watchSerialNumber,
+                                const std::string& systemVersion) {
     writeRootFile("device.plist", Value::Dictionary{{"SerialNumber", serialNumber},
                                                     {"ProductType", "Phone1,1"},
-                                                    {"ProductVersion", "1.0"}});
+                                                    {"ProductVersion", systemVersion}});
     if (!watchSerialNumber) {
         return;
     }

@@ -39,10 +39,11 @@ class AgentProcess {
 
     // Writes a file under the platform root ("device.plist", "apps/x.plist").
     void writeRootFile(const std::string& relativePath, const Value& plist);
-    // This device (a phone with `serialNumber`) and, when given, one paired watch, with the
-    // paired-watches feature on.
+    // This device (a phone with `serialNumber` on `systemVersion`) and, when given, one paired
+    // watch, with the paired-watches feature on.
     void writeDevices(const std::string& serialNumber,
-                      const std::optional<std::string>& watchSerialNumber = std::nullopt);
+                      const std::optional<std::string>& watchSerialNumber = std::nullopt,
+                      const std::string& systemVersion = "1.0");
     // A signed-in user; with a token service, also a KF account (with `tokens`, service ->
     // token) renewed there and a store account.
     void writeAccounts(const std::optional<std::string>& tokenServiceURL = std::nullopt,

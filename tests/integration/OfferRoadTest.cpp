@@ -42,10 +42,7 @@ class OfferRoadTest : public ::testing::Test {
             std::vector<std::string>{"--fixtures", fixtures.str(), "--simulated-clock"});
         ASSERT_FALSE(sim->base().empty());
 
-        agent.writeRootFile("device.plist",
-                            Value(Value::Dictionary{{"SerialNumber", Value(kPhone)},
-                                                    {"ProductType", Value("Phone14,2")},
-                                                    {"ProductVersion", Value("17.2")}}));
+        agent.writeDevices(kPhone, std::nullopt, "17.2");
         agent.writeRootFile(
             "features.plist",
             Value(Value::Dictionary{{"Kestova", Value(Value::Dictionary{{"Tessel_3_0", true}})}}));

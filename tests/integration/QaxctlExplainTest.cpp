@@ -81,10 +81,7 @@ class QaxctlExplainTest : public ::testing::Test {
         agent.extraEnvironment = {
             "QAX_CLOCK=simulated", "QAX_NETWORK=down", "QAX_BOOT_ID=explain-boot",
             "QAX_SHARE_DIR=" + std::string(QAX_SOURCE_DIR) + "/share/qaxagent"};
-        agent.writeRootFile("device.plist",
-                            Value(Value::Dictionary{{"SerialNumber", Value(kPhone)},
-                                                    {"ProductType", Value("Phone14,2")},
-                                                    {"ProductVersion", Value("17.2")}}));
+        agent.writeDevices(kPhone, std::nullopt, "17.2");
         agent.writeAccounts();
         agent.writeRootFile("locale.plist",
                             Value(Value::Dictionary{{"PreferredLocale", Value("en_US")}}));
