@@ -242,23 +242,20 @@ TEST_F(QAXAgentTest, SerialNumberSubstitutionsWatchesWinOverAccessories) {
 }
 
 TEST_F(QAXAgentTest, MigrationRunsOnceBeforeVersionTwo) {
-    struct Row {
-        std::int32_t stored;
-        std::vector<std::string> calls;
-    };
     const std::vector<std::string> migrates = {
         "migrateWarranty PHONE1", "migrateFollowUp PHONE1 with warranty", "setMigrationVersion 2"};
-    const Row rows[] = {{0, migrates}, {1, migrates}, {2, {}}, {3, {}}};
-    for (const auto& row : rows) {
-        SCOPED_TRACE(row.stored);
+    const std::pair<std::int32_t, std::vector<std::string>> rows[] = {
+        {0, migrates}, {1, migrates}, {2, {}}, {3, {}}};
+    for (const auto& [stored, calls] : rows) {
+        SCOPED_TRACE(stored);
         provider = std::make_shared<test::FakeWarrantyProvider>();
         provider->legacyWarranty = warranty("legacy");
-        provider->storedMigrationVersion = row.stored;
+        provider->storedMigrationVersion = stored;
         agent->setWarrantyProvider(provider);
         agent->performMigrationIfNeeded();
-        EXPECT_EQ(provider->calls(), row.calls);
+        EXPECT_EQ(provider->calls(), calls);
         agent->performMigrationIfNeeded();  // a second start-up finds version 2
-        EXPECT_EQ(provider->calls(), row.calls);
+        EXPECT_EQ(provider->calls(), calls);
     }
 }
 

@@ -27,31 +27,26 @@ TEST(VersionCompare, DigitRunsCompareNumerically) {
 }
 
 TEST(Sha256Hash, KnownDigests) {
-    struct Row {
-        std::string input;
-        const char* hex;
-    } rows[] = {
+    const std::pair<std::string, const char*> rows[] = {
         {"", "e3b0c44298fc1c149afbf4c8996fb92427ae41e4649b934ca495991b7852b855"},
         {"abc", "ba7816bf8f01cfea414140de5dae2223b00361a396177a9cb410ff61f20015ad"},
         // Only the bytes before the first zero byte count.
         {std::string("abc\0def", 7),
          "ba7816bf8f01cfea414140de5dae2223b00361a396177a9cb410ff61f20015ad"},
     };
-    for (const auto& r : rows) {
-        EXPECT_EQ(sha256Hash(r.input), r.hex);
+    for (const auto& [input, hex] : rows) {
+        EXPECT_EQ(sha256Hash(input), hex);
     }
 }
 
 TEST(Base64, RoundTripsWithPaddingAndNoLineBreaks) {
-    struct Row {
-        std::string raw;
-        const char* encoded;
-    } rows[] = {{"", ""}, {"f", "Zg=="}, {"fo", "Zm8="}, {"foo", "Zm9v"}, {"foob", "Zm9vYg=="}};
-    for (const auto& r : rows) {
-        EXPECT_EQ(base64Encode(r.raw), r.encoded);
-        auto back = base64Decode(r.encoded);
+    const std::pair<std::string, const char*> rows[] = {
+        {"", ""}, {"f", "Zg=="}, {"fo", "Zm8="}, {"foo", "Zm9v"}, {"foob", "Zm9vYg=="}};
+    for (const auto& [raw, encoded] : rows) {
+        EXPECT_EQ(base64Encode(raw), encoded);
+        auto back = base64Decode(encoded);
         ASSERT_TRUE(back);
-        EXPECT_EQ(std::string(back->begin(), back->end()), r.raw);
+        EXPECT_EQ(std::string(back->begin(), back->end()), raw);
     }
     std::string big(1000, 'x');
     EXPECT_EQ(base64Encode(big).find('\n'), std::string::npos);
@@ -60,10 +55,7 @@ TEST(Base64, RoundTripsWithPaddingAndNoLineBreaks) {
 }
 
 TEST(DateFormats, Iso8601ParseAndPrint) {
-    struct Row {
-        const char* text;
-        double seconds;
-    } rows[] = {
+    const std::pair<const char*, double> rows[] = {
         {"2023-11-14T22:13:20Z", 1700000000},
         {"2023-11-14T22:13:20.500Z", 1700000000.5},
         {"2023-11-14T23:13:20+01:00", 1700000000},
@@ -71,10 +63,10 @@ TEST(DateFormats, Iso8601ParseAndPrint) {
         {"1970-01-01", 0},
         {"2286-11-20T17:46:40Z", 10000000000},
     };
-    for (const auto& r : rows) {
-        auto d = Date::parseIso8601(r.text);
-        ASSERT_TRUE(d) << r.text;
-        EXPECT_DOUBLE_EQ(d->secondsSince1970(), r.seconds) << r.text;
+    for (const auto& [text, seconds] : rows) {
+        auto d = Date::parseIso8601(text);
+        ASSERT_TRUE(d) << text;
+        EXPECT_DOUBLE_EQ(d->secondsSince1970(), seconds) << text;
     }
     for (const char* bad :
          {"", "yesterday", "2023-13-01", "2023-11-14T25:00:00Z", "2023-11-14Tx"}) {

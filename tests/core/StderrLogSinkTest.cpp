@@ -34,18 +34,15 @@ TEST(StderrLogSinkTest, OnlyTheStreamJournalStreamNamesIsTheJournal) {
     const std::string self = std::to_string(st.st_dev) + ":" + std::to_string(st.st_ino);
     const std::string other = std::to_string(st.st_dev) + ":" + std::to_string(st.st_ino + 1);
     const std::string trailing = self + "x";
-    struct Row {
-        const char* value;
-        bool journal;
-    } rows[] = {
+    const std::pair<const char*, bool> rows[] = {
         {self.c_str(), true},
         {other.c_str(), false},  // inherited by a process whose stderr was redirected
         {nullptr, false},
         {trailing.c_str(), false},
     };
-    for (const auto& row : rows) {
-        EXPECT_EQ(StderrLogSink::isJournalStream(row.value, fileno(file)), row.journal)
-            << (row.value ? row.value : "(unset)");
+    for (const auto& [value, journal] : rows) {
+        EXPECT_EQ(StderrLogSink::isJournalStream(value, fileno(file)), journal)
+            << (value ? value : "(unset)");
     }
     std::fclose(file);
 }

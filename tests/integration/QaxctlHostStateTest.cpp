@@ -37,19 +37,17 @@ double offsetOf(const Value& clock) {
 
 TEST_F(QaxctlHostState, ClockAndDefer) {
     EXPECT_EQ(offsetOf(json({"clock", "--json"})), 0);
-    struct Row {
-        const char* amount;
-        double offset;  // after the step
-    } rows[] = {{"3d", 259200}, {"5h", 277200}, {"90s", 277290}, {"30", 277320}, {"-1.5d", 147720}};
-    for (const auto& row : rows) {
-        SCOPED_TRACE(row.amount);
-        auto advanced = r.ctl({"clock", "advance", row.amount});
+    const std::pair<const char*, double> rows[] = {
+        {"3d", 259200}, {"5h", 277200}, {"90s", 277290}, {"30", 277320}, {"-1.5d", 147720}};
+    for (const auto& [amount, offset] : rows) {
+        SCOPED_TRACE(amount);
+        auto advanced = r.ctl({"clock", "advance", amount});
         ASSERT_EQ(advanced.status, 0) << advanced.err << " (no agent listening is no error)";
         auto clock = json({"clock", "--json"});
-        EXPECT_EQ(offsetOf(clock), row.offset);
+        EXPECT_EQ(offsetOf(clock), offset);
         auto now = Date::parseIso8601(*clock.find("now")->asString());
         auto system = Date::parseIso8601(*clock.find("systemTime")->asString());
-        EXPECT_NEAR(now->timeIntervalSince(*system), row.offset, 0.01);
+        EXPECT_NEAR(now->timeIntervalSince(*system), offset, 0.01);
     }
     ASSERT_EQ(r.ctl({"clock", "set", "2030-01-01T00:00:00Z"}).status, 0);
     auto now = Date::parseIso8601(*json({"clock", "--json"}).find("now")->asString());

@@ -212,22 +212,19 @@ TEST_F(HostAccountStoreTest, TokenServiceFailures) {
     CurlHttpClient::Options options;
     options.extraCAFile = server.caFile();
     auto http = std::make_shared<CurlHttpClient>(options);
-    struct Row {
-        std::string url;
-        long code;
-    } rows[] = {
+    const std::pair<std::string, long> rows[] = {
         {server.url("/error"), 503},
         {server.url("/garbage"), HostAccountStore::kRenewalBadAnswer},
         {server.url("/empty"), HostAccountStore::kRenewalBadAnswer},
         {"https://127.0.0.1:" + std::to_string(test::unusedLocalPort()) + "/token",
          HostAccountStore::kRenewalTransportError},
     };
-    for (const auto& row : rows) {
-        SCOPED_TRACE(row.url);
-        write(accountsFile(row.url, "kept"));
+    for (const auto& [url, code] : rows) {
+        SCOPED_TRACE(url);
+        write(accountsFile(url, "kept"));
         HostAccountStore store(tp.platform->platformRoot, http, dispatcher);
         auto result = renew(store, *store.kfAccountForCloudAccount(Account{}));
-        EXPECT_EQ(result.code, row.code);
+        EXPECT_EQ(result.code, code);
         EXPECT_TRUE(result.error && !result.error->empty());
         EXPECT_EQ(storedToken(), "kept");
     }

@@ -163,24 +163,21 @@ TEST(HostBackgroundActivityScheduler, DeferralsBackOffAcrossARestartAndFiresStay
 }
 
 TEST(HostBackgroundActivityScheduler, RegistrationMadeDuringARunOutlivesItsResult) {
-    struct Row {
-        std::int64_t delayDuringRun;
-        double expectedSecondFire;
-    } rows[] = {{300, 300}, {0, 60}};
-    for (const auto& r : rows) {
-        SCOPED_TRACE(r.delayDuringRun);
+    const std::pair<std::int64_t, double> rows[] = {{300, 300}, {0, 60}};
+    for (const auto& [delayDuringRun, expectedSecondFire] : rows) {
+        SCOPED_TRACE(delayDuringRun);
         Harness h;
         std::vector<double> fires;
         h.schedule("x", 0, [&](Completion completion) {
             fires.push_back(h.elapsed());
             if (fires.size() == 1) {
-                h.schedule("x", r.delayDuringRun, h.recorder(fires));
+                h.schedule("x", delayDuringRun, h.recorder(fires));
             }
             completion(ActivityResult::Finished);
         });
         h.env.runner->advanceBy(3600);
         ASSERT_EQ(fires.size(), 2u);
-        EXPECT_NEAR(fires[1], r.expectedSecondFire, 0.01);
+        EXPECT_NEAR(fires[1], expectedSecondFire, 0.01);
         EXPECT_FALSE(h.record("x").pending());
     }
 }

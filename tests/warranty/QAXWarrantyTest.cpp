@@ -42,11 +42,7 @@ std::string iso(const std::optional<Date>& d) {
 }
 
 TEST_F(QAXWarrantyTest, EpochNumbersAreSecondsUpToTenBillionAndMillisecondsAbove) {
-    struct Case {
-        const char* json;  // the value of "coverageEndDate"
-        const char* expected;
-    };
-    const Case cases[] = {
+    const std::pair<const char*, const char*> cases[] = {
         {"1700000000", "2023-11-14T22:13:20.000Z"},
         {"1700000000000", "2023-11-14T22:13:20.000Z"},
         {"1700000000.9", "2023-11-14T22:13:20.000Z"},
@@ -59,12 +55,12 @@ TEST_F(QAXWarrantyTest, EpochNumbersAreSecondsUpToTenBillionAndMillisecondsAbove
         {"[1700000000]", "none"},
         {"null", "none"},
     };
-    for (const auto& c : cases) {
-        SCOPED_TRACE(c.json);
-        auto w = fromJson(std::string("{\"coverageEndDate\": ") + c.json + "}");
+    for (const auto& [json, expected] : cases) {
+        SCOPED_TRACE(json);
+        auto w = fromJson(std::string("{\"coverageEndDate\": ") + json + "}");
         ASSERT_TRUE(w);
-        EXPECT_EQ(iso(w->coverageEndDate()), c.expected);
-        EXPECT_EQ(iso(QAXWarranty::_dateWithEpochNumber(parseJson(c.json))), c.expected);
+        EXPECT_EQ(iso(w->coverageEndDate()), expected);
+        EXPECT_EQ(iso(QAXWarranty::_dateWithEpochNumber(parseJson(json))), expected);
     }
     EXPECT_EQ(iso(fromJson("{}")->coverageEndDate()), "none");
     EXPECT_EQ(iso(QAXWarranty::_dateWithEpochNumber(nullptr)), "none");
@@ -395,11 +391,7 @@ TEST_F(QAXWarrantyTest, ArchivesRoundTripAndRefuseWhatMayNotCrossIPC) {
     withData["coverage"]["coverageDetails"].asArray()->at(0)["blob"] = Value::Data{1, 2, 3};
     Value withNull = summary;
     withNull["coverage"]["benefitsCard"] = *parseJson(R"({"title": null})");
-    struct Refused {
-        const char* name;
-        Value archive;
-    };
-    const Refused refused[] = {
+    const std::pair<const char*, Value> refused[] = {
         {"no summary", archive(Value("QAXWarranty"), std::nullopt)},
         {"a summary that is an array", archive(Value("QAXWarranty"), *parseJson("[{}]"))},
         {"a summary that is a string", archive(Value("QAXWarranty"), Value("{}"))},
@@ -409,9 +401,9 @@ TEST_F(QAXWarrantyTest, ArchivesRoundTripAndRefuseWhatMayNotCrossIPC) {
         {"a null deep inside", archive(Value("QAXWarranty"), withNull)},
         {"not a dictionary", Value("QAXWarranty")},
     };
-    for (const auto& r : refused) {
-        SCOPED_TRACE(r.name);
-        EXPECT_FALSE(QAXWarranty::decode(tp.platform, r.archive));
+    for (const auto& [name, archive] : refused) {
+        SCOPED_TRACE(name);
+        EXPECT_FALSE(QAXWarranty::decode(tp.platform, archive));
     }
 }
 
