@@ -17,11 +17,7 @@ namespace {
 TEST(PrivateText, MarkedSpansAreRedactedOrUnmarked) {
     const std::string watch = "Watch (" + privateText("W7SERIAL") + ")";
     const std::string nested = privateText("a " + privateText("b") + " c");
-    struct Row {
-        std::string message;
-        const char* redacted;
-        const char* shown;
-    } rows[] = {
+    const std::tuple<std::string, const char*, const char*> rows[] = {
         {"no marks", "no marks", "no marks"},
         {watch, "Watch (<private>)", "Watch (W7SERIAL)"},
         {watch + " and " + privateText("C02"), "Watch (<private>) and <private>",
@@ -29,9 +25,9 @@ TEST(PrivateText, MarkedSpansAreRedactedOrUnmarked) {
         {nested, "<private>", "a b c"},
         {privateText(""), "<private>", ""},
     };
-    for (const auto& r : rows) {
-        EXPECT_EQ(resolvePrivateText(r.message, false), r.redacted);
-        EXPECT_EQ(resolvePrivateText(r.message, true), r.shown);
+    for (const auto& [message, redacted, shown] : rows) {
+        EXPECT_EQ(resolvePrivateText(message, false), redacted);
+        EXPECT_EQ(resolvePrivateText(message, true), shown);
     }
 }
 

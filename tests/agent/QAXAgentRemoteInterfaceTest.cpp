@@ -73,16 +73,13 @@ TEST_F(QAXAgentRemoteInterfaceTest, EveryOperationWithGoodAndHostileArguments) {
     const std::string wrong = "error";
     const std::string yes = Value(true).description();
     const std::string no = Value(false).description();
-    struct Case {
-        const char* op;
-        Value::Array args;
-        std::string shape;  // "error", "none", a class name, "[...]" or a printed value
-    };
     const char* kInfo = kInfoOp;
     const char* kAll = "getAllDeviceInfosUsingPolicy:updateFollowUps:withReply:";
     const char* kDefaultInfo = "getDefaultDeviceInfoUsingPolicy:withReply:";
     // clang-format off
-    const Case cases[] = {
+    // Operation, arguments, and the reply's shape: "error", "none", a class name, "[...]" or a
+    // printed value.
+    const std::tuple<const char*, Value::Array, std::string> cases[] = {
         {"scheduleOutreachWithReply:", {}, yes},
         {"scheduleOutreachAfter:withReply:", {Value(3.5)}, yes},
         {"scheduleOutreachAfter:withReply:", {Value(-30)}, yes},
@@ -125,11 +122,11 @@ TEST_F(QAXAgentRemoteInterfaceTest, EveryOperationWithGoodAndHostileArguments) {
         {"defaultDevice", {}, wrong},
     };
     // clang-format on
-    for (const auto& c : cases) {
-        SCOPED_TRACE(std::string(c.op) + " " + Value(c.args).description().substr(0, 80));
-        auto out = invoke(c.op, c.args);
+    for (const auto& [op, args, shape] : cases) {
+        SCOPED_TRACE(std::string(op) + " " + Value(args).description().substr(0, 80));
+        auto out = invoke(op, args);
         EXPECT_EQ(out.calls, 1);
-        EXPECT_EQ(shapeOf(out.reply), c.shape) << out.reply.error.value_or("");
+        EXPECT_EQ(shapeOf(out.reply), shape) << out.reply.error.value_or("");
     }
     // What reached the agent's collaborators, in order.
     EXPECT_EQ(provider->calls(),

@@ -9,20 +9,16 @@ namespace qax {
 namespace {
 
 TEST(VersionCompare, DigitRunsCompareNumerically) {
-    struct Row {
-        const char* a;
-        const char* b;
-        int sign;
-    } rows[] = {
+    const std::tuple<const char*, const char*, int> rows[] = {
         {"4.10", "4.9", 1},  {"4.9", "4.10", -1},    {"4.2", "4.2", 0},
         {"4.2.1", "4.2", 1}, {"4.2", "4.2.1", -1},   {"10.0", "9.9.9", 1},
         {"4.02", "4.2", 0},  {"4.2b", "4.2a", 1},    {"", "", 0},
         {"1", "", 1},        {"12A345", "12A99", 1}, {"99999999999999999999", "1", 1},
     };
-    for (const auto& r : rows) {
-        int c = compareVersions(r.a, r.b);
-        EXPECT_EQ((c > 0) - (c < 0), r.sign) << r.a << " vs " << r.b;
-        EXPECT_EQ(isVersionGreater(r.a, r.b), r.sign > 0) << r.a << " vs " << r.b;
+    for (const auto& [a, b, sign] : rows) {
+        int c = compareVersions(a, b);
+        EXPECT_EQ((c > 0) - (c < 0), sign) << a << " vs " << b;
+        EXPECT_EQ(isVersionGreater(a, b), sign > 0) << a << " vs " << b;
     }
 }
 

@@ -96,24 +96,21 @@ TEST_F(QaxctlHostState, FollowUpsAsTheSettingsApplicationWouldShowThem) {
     post("a", 2 | 1, true);
     post("b", 2 | 16, false);
 
-    struct Step {
-        const char* advance;  // before looking
-        const char* dayText;  // of both items; none once expired
-        bool expired;
-    } steps[] = {
+    // The clock advanced before looking; both items' day text (none once expired); expired.
+    const std::tuple<const char*, const char*, bool> steps[] = {
         {nullptr, "3 days left", false}, {"2d", "1 day left", false}, {"1d", nullptr, true}};
-    for (const auto& s : steps) {
-        SCOPED_TRACE(s.advance ? s.advance : "now");
-        if (s.advance) {
-            ASSERT_EQ(r.ctl({"clock", "advance", s.advance}).status, 0);
+    for (const auto& [advance, dayText, expired] : steps) {
+        SCOPED_TRACE(advance ? advance : "now");
+        if (advance) {
+            ASSERT_EQ(r.ctl({"clock", "advance", advance}).status, 0);
         }
         auto list = json({"followups", "--json"});
         ASSERT_TRUE(list.isArray());
         ASSERT_EQ(list.size(), 2u);
         for (const auto& item : *list.asArray()) {
-            EXPECT_EQ(*item.find("expired"), Value(s.expired));
-            if (s.dayText) {
-                EXPECT_EQ(*item.find("dayText"), Value(s.dayText));
+            EXPECT_EQ(*item.find("expired"), Value(expired));
+            if (dayText) {
+                EXPECT_EQ(*item.find("dayText"), Value(dayText));
             } else {
                 EXPECT_FALSE(item.find("dayText"));
             }

@@ -62,11 +62,8 @@ TEST(HostStoreBindings, FailuresCompleteOnceWithAReason) {
 
     const std::string unreachable =
         "https://127.0.0.1:" + std::to_string(test::unusedLocalPort()) + "/lookup";
-    struct Row {
-        std::optional<std::string> url;  // none: no store.plist
-        const char* lookupReason;
-        const char* purchasesReason;
-    } rows[] = {
+    // The URL in store.plist (none: no file) and what each binding's reason says.
+    const std::tuple<std::optional<std::string>, const char*, const char*> rows[] = {
         {std::nullopt, "names no LookupURL", "names no PurchasesURL"},
         {"ftp://127.0.0.1/lookup", "is not an http(s) URL", "is not an http(s) URL"},
         {"not a url", "is not an http(s) URL", "is not an http(s) URL"},
@@ -82,13 +79,13 @@ TEST(HostStoreBindings, FailuresCompleteOnceWithAReason) {
     };
     HostStoreLookup lookup(root.path().string(), http, dispatcher);
     HostPurchaseHistory purchases(root.path().string(), http, dispatcher);
-    for (const auto& row : rows) {
-        SCOPED_TRACE(row.url.value_or("no store.plist"));
-        storeFile(row.url);
+    for (const auto& [url, lookupReason, purchasesReason] : rows) {
+        SCOPED_TRACE(url.value_or("no store.plist"));
+        storeFile(url);
         auto found = wait<StoreItem>(
             [&](auto done) { lookup.lookUpBundleIdentifier("x", std::move(done)); });
         ASSERT_TRUE(found.error);
-        EXPECT_NE(found.error->find(row.lookupReason), std::string::npos) << *found.error;
+        EXPECT_NE(found.error->find(lookupReason), std::string::npos) << *found.error;
         EXPECT_EQ(found.error->rfind("store look-up: ", 0), 0u) << *found.error;
         EXPECT_TRUE(found.records.empty());
         EXPECT_NE(found.thread, std::this_thread::get_id());
@@ -96,7 +93,7 @@ TEST(HostStoreBindings, FailuresCompleteOnceWithAReason) {
         auto bought = wait<PurchaseRecord>(
             [&](auto done) { purchases.purchasesForAccount(0, {"x"}, std::move(done)); });
         ASSERT_TRUE(bought.error);
-        EXPECT_NE(bought.error->find(row.purchasesReason), std::string::npos) << *bought.error;
+        EXPECT_NE(bought.error->find(purchasesReason), std::string::npos) << *bought.error;
         EXPECT_TRUE(bought.records.empty());
     }
 
