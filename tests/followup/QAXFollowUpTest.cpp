@@ -84,22 +84,18 @@ class QAXFollowUpTest : public ::testing::Test {
 TEST_F(QAXFollowUpTest, PostedItemIdentifiesAndTargetsTheDevice) {
     EXPECT_EQ(QAXFollowUp::uniqueIdentfierForSerialNumber(std::nullopt), kClient);
 
-    struct Row {
-        QAXDeviceType type;
-        std::optional<std::string> target;
-        const char* typeText;
-    };
-    const Row rows[] = {{QAXDeviceTypeDefault, "com.velmora.Preferences", "Default"},
-                        {QAXDeviceTypeWatch, "com.velmora.Bridge", "Watch"},
-                        {QAXDeviceTypeOther, std::nullopt, "Other"}};
-    for (const Row& row : rows) {
-        SCOPED_TRACE(row.typeText);
-        const std::string serial = std::string("SN-") + row.typeText;
-        followUp.postFollowUpWithDeviceInfo(info(serial, offer(30), row.type));
+    const std::tuple<QAXDeviceType, std::optional<std::string>, const char*> rows[] = {
+        {QAXDeviceTypeDefault, "com.velmora.Preferences", "Default"},
+        {QAXDeviceTypeWatch, "com.velmora.Bridge", "Watch"},
+        {QAXDeviceTypeOther, std::nullopt, "Other"}};
+    for (const auto& [type, target, typeText] : rows) {
+        SCOPED_TRACE(typeText);
+        const std::string serial = std::string("SN-") + typeText;
+        followUp.postFollowUpWithDeviceInfo(info(serial, offer(30), type));
         auto item = pending(serial);
         ASSERT_TRUE(item);
         EXPECT_EQ(item->uniqueIdentifier, std::string(kClient) + "." + sha256Hash(serial));
-        EXPECT_EQ(item->targetBundleIdentifier, row.target);
+        EXPECT_EQ(item->targetBundleIdentifier, target);
         EXPECT_EQ(item->groupIdentifier, "com.velmora.followup.group.qax");
         EXPECT_EQ(item->extensionIdentifier, "com.velmora.Kestova.Extension");
         EXPECT_EQ(item->title, "Haverly for your phone");
@@ -116,7 +112,7 @@ TEST_F(QAXFollowUpTest, PostedItemIdentifiesAndTargetsTheDevice) {
         EXPECT_FALSE(item->actions[0].url);
         EXPECT_TRUE(logged("Posted follow-up: serialNumber:" + serial + " -> success"));
         EXPECT_EQ(analytics->events().back().payload,
-                  Value(Value::Dictionary{{"devicetype", row.typeText}}));
+                  Value(Value::Dictionary{{"devicetype", typeText}}));
     }
     EXPECT_EQ(analytics->events().size(), 3u);
 
@@ -292,19 +288,16 @@ TEST_F(QAXFollowUpTest, DismissalKeepsTheOfferAwayUntilANewOfferPeriod) {
                        device->device()->description() + ", leaving unposted"));
 
     // Conversion: dismissal date against the current display date.
-    struct Row {
-        double displayDaysFromDismissal;
-        bool converts;
-    };
     tp.clock->advanceBy(5 * kDay);
     const Date dismissedAt = at(-5);
-    for (const Row row : {Row{0, false}, Row{-1, false}, Row{1, true}}) {
-        SCOPED_TRACE(row.displayDaysFromDismissal);
+    const std::pair<double, bool> rows[] = {{0, false}, {-1, false}, {1, true}};
+    for (const auto& [displayDaysFromDismissal, converts] : rows) {
+        SCOPED_TRACE(displayDaysFromDismissal);
         summary["hvOfferFollowupDisplayDate"] = Value(static_cast<std::int64_t>(
-            dismissedAt.secondsSince1970() + row.displayDaysFromDismissal * kDay));
+            dismissedAt.secondsSince1970() + displayDaysFromDismissal * kDay));
         auto converted = info("SN", summary);
-        EXPECT_EQ(followUp.postFollowUpWithDevicesInfo({converted}), row.converts);
-        EXPECT_EQ(pending("SN").has_value(), row.converts);
+        EXPECT_EQ(followUp.postFollowUpWithDevicesInfo({converted}), converts);
+        EXPECT_EQ(pending("SN").has_value(), converts);
     }
     EXPECT_TRUE(logged("Device not eligible for conversion. " + device->device()->description() +
                        ", followup dismissed date: " + dismissedAt.description() +
