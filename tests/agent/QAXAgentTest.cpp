@@ -213,31 +213,26 @@ TEST_F(QAXAgentTest, SerialNumberSubstitutionsWatchesWinOverAccessories) {
         "PairedBluetoothDevicesSerialNumbers",
         Value(Value::Dictionary{{"X", "ACC"}, {"A", "B"}, {"N", 7}}));
     provider->setDownloadResult("W1", warranty("w1"));
-    struct Row {
-        const char* asked;
-        const char* evaluated;
-        const char* name;
-        QAXDeviceType type;
-    } rows[] = {
+    const std::tuple<const char*, const char*, const char*, QAXDeviceType> rows[] = {
         {"X", "W1", "One", QAXDeviceTypeWatch},
         {"A", "B", "<unknown>", QAXDeviceTypeOther},
         {"N", "N", "<unknown>", QAXDeviceTypeOther},
         {"PHONE1", "PHONE1", "Default Device", QAXDeviceTypeDefault},
     };
-    for (const auto& row : rows) {
-        SCOPED_TRACE(row.asked);
+    for (const auto& [asked, evaluated, name, type] : rows) {
+        SCOPED_TRACE(asked);
         std::shared_ptr<QAXDeviceInfo> info;
-        agent->getDeviceInfoForSerialNumber(row.asked, QAXWarrantyPolicyForceDownload,
+        agent->getDeviceInfoForSerialNumber(asked, QAXWarrantyPolicyForceDownload,
                                             [&](auto i) { info = i; });
         ASSERT_TRUE(info);
-        EXPECT_EQ(info->device()->serialNumber(), row.evaluated);
-        EXPECT_EQ(info->device()->name(), row.name);
-        EXPECT_EQ(info->device()->deviceType(), row.type);
-        if (row.type == QAXDeviceTypeOther) {
+        EXPECT_EQ(info->device()->serialNumber(), evaluated);
+        EXPECT_EQ(info->device()->name(), name);
+        EXPECT_EQ(info->device()->deviceType(), type);
+        if (type == QAXDeviceTypeOther) {
             EXPECT_FALSE(info->device()->activationDate());
         }
-        EXPECT_EQ(downloads().back(), std::string("download ") + row.evaluated);
-        EXPECT_EQ(provider->calls().back(), std::string("refreshOne ") + row.evaluated);
+        EXPECT_EQ(downloads().back(), std::string("download ") + evaluated);
+        EXPECT_EQ(provider->calls().back(), std::string("refreshOne ") + evaluated);
     }
 }
 

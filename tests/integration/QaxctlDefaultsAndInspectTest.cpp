@@ -30,12 +30,7 @@ class QaxctlDefaultsAndInspect : public ::testing::Test {
 };
 
 TEST_F(QaxctlDefaultsAndInspect, DefaultsWriteReadDeleteAndRefuseBadInput) {
-    struct Row {
-        const char* type;
-        const char* text;
-        const char* key;
-        Value expected;
-    } rows[] = {
+    const std::tuple<const char*, const char*, const char*, Value> rows[] = {
         {"-string", "C02OVERRIDE", "SerialNumber", Value("C02OVERRIDE")},
         {"-int", "2", "QAXMigrationVersion", Value(2)},
         {"-real", "-86400.5", "W1.activationInterval", Value(-86400.5)},
@@ -46,15 +41,15 @@ TEST_F(QaxctlDefaultsAndInspect, DefaultsWriteReadDeleteAndRefuseBadInput) {
         {"-json", R"(["a","b"])", "FollowupPostedSerialNumberHashes",
          Value(Value::Array{"a", "b"})},
     };
-    for (const auto& r : rows) {
-        SCOPED_TRACE(r.text);
-        auto w = ctl({"defaults", "write", r.key, r.type, r.text});
+    for (const auto& [type, text, key, expected] : rows) {
+        SCOPED_TRACE(text);
+        auto w = ctl({"defaults", "write", key, type, text});
         ASSERT_EQ(w.status, 0) << w.err;
-        EXPECT_EQ(agentView.objectForKey(r.key), r.expected);
+        EXPECT_EQ(agentView.objectForKey(key), expected);
     }
     auto read = ctl({"defaults", "read", "ServerVersionOverride", "--json"});
     ASSERT_EQ(read.status, 0);
-    EXPECT_EQ(parseJson(read.out), rows[5].expected);
+    EXPECT_EQ(parseJson(read.out), std::get<3>(rows[5]));
     // A key with only a registered default reads that default.
     EXPECT_EQ(ctl({"defaults", "read", "CachedWarrantyValidityDuration"}).out, "86400\n");
     auto all = parseJson(ctl({"defaults", "read", "--json"}).out);

@@ -330,12 +330,8 @@ TEST_F(QaxctlExplainTest, BadInputGetsAClearAnswer) {
     const fs::path cacheFile = fs::path(agent.home()) /
                                "Library/Application Support/com.velmora.Kestova" /
                                (sha256Hash(kPhone) + "_Warranty.plist");
-    struct Row {
-        const char* name;
-        std::vector<std::string> args;
-        fs::path corrupt;  // written with garbage first
-        const char* text;  // in the text output
-    } rows[] = {
+    // The arguments, a file written with garbage first, and what the text output says.
+    const std::tuple<const char*, std::vector<std::string>, fs::path, const char*> rows[] = {
         {"unknown serial", {"NOSUCHSERIAL"}, {}, "tracks no device with the serial number"},
         {"no cache", {"NOSUCHSERIAL"}, {}, "No cached warranty"},
         {"corrupt follow-up store",
@@ -349,14 +345,14 @@ TEST_F(QaxctlExplainTest, BadInputGetsAClearAnswer) {
          fs::path(agent.home()) / "Library/Preferences/com.velmora.qaxagent.plist",
          "Preference domain file"},
     };
-    for (const auto& row : rows) {
-        SCOPED_TRACE(row.name);
-        if (!row.corrupt.empty()) {
-            test::writeFile(row.corrupt, "<plist><dict><key>x</key>");
+    for (const auto& [name, args, corrupt, said] : rows) {
+        SCOPED_TRACE(name);
+        if (!corrupt.empty()) {
+            test::writeFile(corrupt, "<plist><dict><key>x</key>");
         }
         std::string text;
-        explain(row.args, &text);
-        EXPECT_NE(text.find(row.text), std::string::npos) << text;
+        explain(args, &text);
+        EXPECT_NE(text.find(said), std::string::npos) << text;
     }
     for (const auto& bad :
          std::vector<std::vector<std::string>>{{"explain", "A", "B"}, {"explain", "--verbose"}}) {

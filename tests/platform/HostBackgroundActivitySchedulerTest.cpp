@@ -102,35 +102,31 @@ class Harness {
 };
 
 TEST(HostBackgroundActivityScheduler, FiresAtItsDueTimeAndSurvivesARestart) {
-    struct Row {
-        const char* name;
-        double restartAfter;  // < 0: no restart
-        double attachAfter;   // after the restart: when the handler is attached again
-        double expectedFire;
-    } rows[] = {
+    // A restart (< 0: none), when the handler is attached again after it, the expected fire.
+    const std::tuple<const char*, double, double, double> rows[] = {
         {"no restart", -1, 0, 100},
         {"restart before due, attached at once", 40, 40, 100},
         {"restart before due, attached late", 40, 250, 250},
     };
-    for (const auto& r : rows) {
-        SCOPED_TRACE(r.name);
+    for (const auto& [name, restartAfter, attachAfter, expectedFire] : rows) {
+        SCOPED_TRACE(name);
         Harness h;
         std::vector<double> fires;
         h.schedule("x", 100, h.recorder(fires));
-        if (r.restartAfter >= 0) {
-            h.env.runner->advanceBy(r.restartAfter);
+        if (restartAfter >= 0) {
+            h.env.runner->advanceBy(restartAfter);
             h.restart();
-            h.env.runner->advanceBy(r.attachAfter - r.restartAfter);
+            h.env.runner->advanceBy(attachAfter - restartAfter);
             ASSERT_TRUE(fires.empty());
             h.attach("x", h.recorder(fires));
         }
-        if (r.expectedFire > h.elapsed()) {
-            h.env.runner->advanceBy(r.expectedFire - h.elapsed() - 0.5);
+        if (expectedFire > h.elapsed()) {
+            h.env.runner->advanceBy(expectedFire - h.elapsed() - 0.5);
             EXPECT_TRUE(fires.empty()) << "not before its due time";
         }
         h.env.runner->advanceBy(1000);
         ASSERT_EQ(fires.size(), 1u);
-        EXPECT_NEAR(fires[0], r.expectedFire, 0.01);
+        EXPECT_NEAR(fires[0], expectedFire, 0.01);
         auto record = h.record("x");
         EXPECT_FALSE(record.pending()) << "result 1 removes the registration";
         EXPECT_EQ(record.lastResult, 1);

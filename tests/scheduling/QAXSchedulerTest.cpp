@@ -58,27 +58,21 @@ class QAXSchedulerTest : public ::testing::Test {
 
 TEST_F(QAXSchedulerTest, DelayIsClampedAndTruncatedToWholeSeconds) {
     const double inf = std::numeric_limits<double>::infinity();
-    struct Row {
-        double delay;
-        std::int64_t delaySeconds;
-        std::int64_t grace;
-        bool targetIsNowPlusDelay;
-    };
-    const Row rows[] = {
+    const std::tuple<double, std::int64_t, std::int64_t, bool> rows[] = {
         {25, 25, 2, true},  {9.9, 9, 0, true},   {3600, 3600, 360, true},
         {0, 0, 0, true},    {-30, 0, 0, true},   {std::nan(""), 0, 0, false},
         {inf, 0, 0, false}, {-inf, 0, 0, false},
     };
-    for (const Row& row : rows) {
-        SCOPED_TRACE(row.delay);
-        const bool network = row.delaySeconds % 2 == 0;
+    for (const auto& [delay, delaySeconds, grace, targetIsNowPlusDelay] : rows) {
+        SCOPED_TRACE(delay);
+        const bool network = delaySeconds % 2 == 0;
         auto scheduler = make(std::make_shared<RecordingActivity>(network));
-        scheduler->scheduleActivityWithDelay(row.delay);
+        scheduler->scheduleActivityWithDelay(delay);
 
         auto criteria = activity()->told().criteria;
         ASSERT_TRUE(criteria);
-        EXPECT_EQ(criteria->delaySeconds, row.delaySeconds);
-        EXPECT_EQ(criteria->gracePeriodSeconds, row.grace);
+        EXPECT_EQ(criteria->delaySeconds, delaySeconds);
+        EXPECT_EQ(criteria->gracePeriodSeconds, grace);
         EXPECT_EQ(criteria->requiresNetwork, network);
         EXPECT_TRUE(criteria->priorityUtility);
         EXPECT_FALSE(activity()->told().preregistered);
@@ -87,7 +81,7 @@ TEST_F(QAXSchedulerTest, DelayIsClampedAndTruncatedToWholeSeconds) {
         EXPECT_TRUE(activity()->armed());
 
         const Date now = tp.clock->now();
-        const Date expected = row.targetIsNowPlusDelay ? now.byAdding(row.delay) : now;
+        const Date expected = targetIsNowPlusDelay ? now.byAdding(delay) : now;
         EXPECT_EQ(scheduler->scheduledActivityDate(), expected);
     }
 }

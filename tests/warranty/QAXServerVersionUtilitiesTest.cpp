@@ -253,25 +253,19 @@ TEST_F(QAXServerVersionUtilitiesTest, ACacheThatIsNoDictionaryIsRemovedAndIgnore
     constexpr const char* kRemoving =
         "Incorrect format stored in server version cache. Removing it.";
     serveList(versionList(3, 5));
-    struct Case {
-        QAXServerLookupPolicy policy;
-        QAXVersionSet overlap;
-        std::optional<Value> cacheAfter;
-        int hits;
-    };
-    const Case cases[] = {
+    const std::tuple<QAXServerLookupPolicy, QAXVersionSet, std::optional<Value>, int> cases[] = {
         {QAXServerLookupPolicyNoNetwork, {2, 3}, std::nullopt, 0},
         {QAXServerLookupPolicyCacheFirst, {3}, versionList(3, 5), 1},
     };
-    for (const auto& c : cases) {
-        SCOPED_TRACE(c.policy);
+    for (const auto& [policy, overlap, cacheAfter, fetches] : cases) {
+        SCOPED_TRACE(policy);
         preferences().setObject(kCache, "not a list");
         tp.log->clear();
         const int before = hits();
-        EXPECT_EQ(negotiate(c.policy), c.overlap);
+        EXPECT_EQ(negotiate(policy), overlap);
         EXPECT_EQ(tp.log->count(kRemoving), 1);
-        EXPECT_EQ(cache(), c.cacheAfter);
-        EXPECT_EQ(hits(), before + c.hits);
+        EXPECT_EQ(cache(), cacheAfter);
+        EXPECT_EQ(hits(), before + fetches);
     }
 
     // With nothing cached, the immediate form answers from the client versions and leaves

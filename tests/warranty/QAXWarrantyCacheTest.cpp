@@ -97,12 +97,8 @@ TEST_F(QAXWarrantyCacheTest, EachReadGetsWhatIsOnDiskThen) {
     // Each change is made right after a read; the first two keep the size, and within a clock
     // tick the file times need not move either. Content that is no record reads as none.
     const fs::path file = cacheDirectory() / (sha256Hash("S") + "_Warranty.plist");
-    struct Row {
-        const char* name;
-        std::string content;
-        bool inPlace;  // else replaced by a rename
-        std::optional<Value> record;
-    } rows[] = {
+    // Each change: in place or by a rename, and the record read after it.
+    const std::tuple<const char*, std::string, bool, std::optional<Value>> rows[] = {
         {"rewritten in place", *toXmlPlist(summary("bbbb")), true, summary("bbbb")},
         {"replaced by rename", *toXmlPlist(summary("aaaa")), false, summary("aaaa")},
         {"array root", *toXmlPlist(Value(Value::Array{Value("a")})), true, std::nullopt},
@@ -116,15 +112,15 @@ TEST_F(QAXWarrantyCacheTest, EachReadGetsWhatIsOnDiskThen) {
         auto w = QAXWarranty::cachedWarrantyForSerialNumber(tp.platform, "S");
         return w ? std::optional<Value>(w->dictionaryRepresentation()) : std::nullopt;
     };
-    for (const auto& row : rows) {
-        SCOPED_TRACE(row.name);
+    for (const auto& [name, content, inPlace, record] : rows) {
+        SCOPED_TRACE(name);
         read();
-        if (row.inPlace) {
-            test::writeFile(file, row.content);
+        if (inPlace) {
+            test::writeFile(file, content);
         } else {
-            ASSERT_TRUE(writeFileAtomically(file.string(), row.content));
+            ASSERT_TRUE(writeFileAtomically(file.string(), content));
         }
-        EXPECT_EQ(read(), row.record);
+        EXPECT_EQ(read(), record);
     }
 }
 
