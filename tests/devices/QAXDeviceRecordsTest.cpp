@@ -21,28 +21,23 @@ Value overTheWire(const Value& archive) {
 }
 
 TEST(QAXDeviceTest, ArchiveRoundTripKeepsEveryField) {
-    struct Case {
-        std::optional<std::string> name;
-        std::optional<std::string> serial;
-        std::optional<Date> activated;
-        QAXDeviceType type;
-        const char* typeString;
-    };
-    const Case cases[] = {
-        {"Default Device", "C02SERIAL", Date(1'700'000'000), QAXDeviceTypeDefault, "Default"},
-        {"Morning Watch", "W1", Date(1'600'000'000.5), QAXDeviceTypeWatch, "Watch"},
-        {"<unknown>", "X9", std::nullopt, QAXDeviceTypeOther, "Other"},
-        {std::nullopt, std::nullopt, std::nullopt, static_cast<QAXDeviceType>(7), "Default"},
-    };
-    for (const auto& c : cases) {
-        auto device = QAXDevice::deviceWithName(c.name, c.serial, c.activated, c.type);
+    const std::tuple<std::optional<std::string>, std::optional<std::string>, std::optional<Date>,
+                     QAXDeviceType, const char*>
+        cases[] = {
+            {"Default Device", "C02SERIAL", Date(1'700'000'000), QAXDeviceTypeDefault, "Default"},
+            {"Morning Watch", "W1", Date(1'600'000'000.5), QAXDeviceTypeWatch, "Watch"},
+            {"<unknown>", "X9", std::nullopt, QAXDeviceTypeOther, "Other"},
+            {std::nullopt, std::nullopt, std::nullopt, static_cast<QAXDeviceType>(7), "Default"},
+        };
+    for (const auto& [name, serial, activated, type, typeString] : cases) {
+        auto device = QAXDevice::deviceWithName(name, serial, activated, type);
         auto decoded = QAXDevice::decode(overTheWire(device->encode()));
         ASSERT_NE(decoded, nullptr) << device->description();
-        EXPECT_EQ(decoded->name(), c.name);
-        EXPECT_EQ(decoded->serialNumber(), c.serial);
-        EXPECT_EQ(decoded->activationDate(), c.activated);
-        EXPECT_EQ(decoded->deviceType(), c.type);
-        EXPECT_EQ(decoded->deviceTypeString(), c.typeString);
+        EXPECT_EQ(decoded->name(), name);
+        EXPECT_EQ(decoded->serialNumber(), serial);
+        EXPECT_EQ(decoded->activationDate(), activated);
+        EXPECT_EQ(decoded->deviceType(), type);
+        EXPECT_EQ(decoded->deviceTypeString(), typeString);
     }
 }
 

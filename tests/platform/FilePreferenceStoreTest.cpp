@@ -55,22 +55,16 @@ TEST_F(FilePreferenceStoreTest, RegisteredDefaultsStoredValuesRemovalAndTypedRea
     EXPECT_EQ(store.integerForKey("HighServerVersion"), 3);
     EXPECT_EQ(settings::migrationVersion(store), 0);
 
-    struct Row {
-        const char* key;
-        Value stored;
-        bool asBool;
-        std::int64_t asInt;
-        double asDouble;
-    } rows[] = {
+    const std::tuple<const char*, Value, bool, std::int64_t, double> rows[] = {
         {"b", Value(true), true, 1, 1.0},    {"i", Value(2), true, 2, 2.0},
         {"r", Value(2.75), true, 2, 2.75},   {"s", Value("12.5"), true, 12, 12.5},
         {"yes", Value("YES"), true, 0, 0.0}, {"zero", Value(0), false, 0, 0.0},
     };
-    for (const auto& r : rows) {
-        ASSERT_TRUE(store.setObject(r.key, r.stored));
-        EXPECT_EQ(store.boolForKey(r.key), r.asBool) << r.key;
-        EXPECT_EQ(store.integerForKey(r.key), r.asInt) << r.key;
-        EXPECT_EQ(store.doubleForKey(r.key), r.asDouble) << r.key;
+    for (const auto& [key, stored, asBool, asInt, asDouble] : rows) {
+        ASSERT_TRUE(store.setObject(key, stored));
+        EXPECT_EQ(store.boolForKey(key), asBool) << key;
+        EXPECT_EQ(store.integerForKey(key), asInt) << key;
+        EXPECT_EQ(store.doubleForKey(key), asDouble) << key;
     }
     ASSERT_TRUE(store.setObject("QAXMigrationVersion", Value(2)));
     EXPECT_EQ(settings::migrationVersion(store), 2);

@@ -77,45 +77,42 @@ class QAXServerVersionUtilitiesTest : public ::testing::Test {
 };
 
 TEST_F(QAXServerVersionUtilitiesTest, OverlapOfTheEndPointsDecidesSupportAndTheHighFeatureSet) {
-    struct Case {
-        const char* name;
-        Value list;
-        std::optional<QAXVersionSet> overlap;
-        bool enabled;
-        const char* message;
-    };
     Value withExtraKey = versionList(2, 3);
     withExtraKey["MinimumClient"] = "4.0";
-    const Case cases[] = {
-        {"same pair", versionList(2, 3), QAXVersionSet{2, 3}, true,
-         "clientAndServerSet '{(2, 3)}'"},
-        {"strings", versionList("2", "2"), QAXVersionSet{2}, false, "clientAndServerSet '{(2)}'"},
-        {"end points only", versionList(1, 4), QAXVersionSet{}, false, "clientAndServerSet '{()}'"},
-        {"newer server", versionList(3, 5), QAXVersionSet{3}, true, "Server versions '{(3, 5)}'"},
-        {"other keys are kept", withExtraKey, QAXVersionSet{2, 3}, true,
-         "Client versions '{(2, 3)}'"},
-        {"no high version", Value(Value::Dictionary{{"LowServerVersion", 2}}), std::nullopt, false,
-         "Server version dictionary missing key 'HighServerVersion'"},
-        {"no low version", Value(Value::Dictionary{{"HighServerVersion", 3}}), std::nullopt, false,
-         "Server version dictionary missing key 'LowServerVersion'"},
-    };
-    for (const auto& c : cases) {
-        SCOPED_TRACE(c.name);
+    const std::tuple<const char*, Value, std::optional<QAXVersionSet>, bool, const char*> cases[] =
+        {
+            {"same pair", versionList(2, 3), QAXVersionSet{2, 3}, true,
+             "clientAndServerSet '{(2, 3)}'"},
+            {"strings", versionList("2", "2"), QAXVersionSet{2}, false,
+             "clientAndServerSet '{(2)}'"},
+            {"end points only", versionList(1, 4), QAXVersionSet{}, false,
+             "clientAndServerSet '{()}'"},
+            {"newer server", versionList(3, 5), QAXVersionSet{3}, true,
+             "Server versions '{(3, 5)}'"},
+            {"other keys are kept", withExtraKey, QAXVersionSet{2, 3}, true,
+             "Client versions '{(2, 3)}'"},
+            {"no high version", Value(Value::Dictionary{{"LowServerVersion", 2}}), std::nullopt,
+             false, "Server version dictionary missing key 'HighServerVersion'"},
+            {"no low version", Value(Value::Dictionary{{"HighServerVersion", 3}}), std::nullopt,
+             false, "Server version dictionary missing key 'LowServerVersion'"},
+        };
+    for (const auto& [name, list, overlap, enabled, message] : cases) {
+        SCOPED_TRACE(name);
         preferences().removeObject(kCache);
         tp.log->clear();
-        serveList(c.list);
+        serveList(list);
         const int before = hits();
 
-        EXPECT_EQ(negotiate(QAXServerLookupPolicyNetworkFirst), c.overlap);
-        EXPECT_EQ(tp.log->count(c.message), 1);
-        EXPECT_EQ(cache(), c.list);  // the fetched list, as it was
-        EXPECT_EQ(supported(), c.overlap && !c.overlap->empty());
+        EXPECT_EQ(negotiate(QAXServerLookupPolicyNetworkFirst), overlap);
+        EXPECT_EQ(tp.log->count(message), 1);
+        EXPECT_EQ(cache(), list);  // the fetched list, as it was
+        EXPECT_EQ(supported(), overlap && !overlap->empty());
         EXPECT_EQ(hits(), before + 2);
 
         // The other policies answer from the cache, without the network.
-        EXPECT_EQ(highEnabled(QAXServerLookupPolicyCacheFirst), c.enabled);
+        EXPECT_EQ(highEnabled(QAXServerLookupPolicyCacheFirst), enabled);
         EXPECT_EQ(QAXServerVersionUtilities::isHighServerVersionFeaturesetEnabled(*tp.platform),
-                  c.enabled);
+                  enabled);
         EXPECT_EQ(hits(), before + 2);
     }
 }
@@ -187,35 +184,29 @@ TEST_F(QAXServerVersionUtilitiesTest, AnUnreachableServerFallsBackByPolicy) {
     preferences().setObject(
         settings::kServerVersionURL,
         "https://127.0.0.1:" + std::to_string(test::unusedLocalPort()) + kListPath);
-    struct Case {
-        QAXServerLookupPolicy policy;
-        std::optional<Value> cached;
-        QAXVersionSet overlap;
-        std::optional<Value> cacheAfter;
-        int fetchFailures;
-    };
-    const Case cases[] = {
-        {QAXServerLookupPolicyCacheFirst, std::nullopt, {2, 3}, std::nullopt, 1},
-        {QAXServerLookupPolicyCacheFirst, versionList(3, 5), {3}, versionList(3, 5), 0},
-        {QAXServerLookupPolicy(7), std::nullopt, {2, 3}, std::nullopt, 1},
-        {QAXServerLookupPolicyNoNetwork, std::nullopt, {2, 3}, std::nullopt, 0},
-        {QAXServerLookupPolicyNoNetwork, versionList(3, 5), {3}, versionList(3, 5), 0},
-        {QAXServerLookupPolicyNetworkFirst, std::nullopt, {2, 3}, versionList(2, 3), 1},
-        {QAXServerLookupPolicyNetworkFirst, versionList(3, 5), {3}, versionList(3, 5), 1},
-    };
-    for (const auto& c : cases) {
-        SCOPED_TRACE(testing::Message()
-                     << "policy " << c.policy << " cached " << c.cached.has_value());
+    const std::tuple<QAXServerLookupPolicy, std::optional<Value>, QAXVersionSet,
+                     std::optional<Value>, int>
+        cases[] = {
+            {QAXServerLookupPolicyCacheFirst, std::nullopt, {2, 3}, std::nullopt, 1},
+            {QAXServerLookupPolicyCacheFirst, versionList(3, 5), {3}, versionList(3, 5), 0},
+            {QAXServerLookupPolicy(7), std::nullopt, {2, 3}, std::nullopt, 1},
+            {QAXServerLookupPolicyNoNetwork, std::nullopt, {2, 3}, std::nullopt, 0},
+            {QAXServerLookupPolicyNoNetwork, versionList(3, 5), {3}, versionList(3, 5), 0},
+            {QAXServerLookupPolicyNetworkFirst, std::nullopt, {2, 3}, versionList(2, 3), 1},
+            {QAXServerLookupPolicyNetworkFirst, versionList(3, 5), {3}, versionList(3, 5), 1},
+        };
+    for (const auto& [policy, cached, overlap, cacheAfter, fetchFailures] : cases) {
+        SCOPED_TRACE(testing::Message() << "policy " << policy << " cached " << cached.has_value());
         preferences().removeObject(kCache);
-        if (c.cached) {
-            preferences().setObject(kCache, *c.cached);
+        if (cached) {
+            preferences().setObject(kCache, *cached);
         }
         tp.log->clear();
-        EXPECT_EQ(negotiate(c.policy), c.overlap);
-        EXPECT_EQ(cache(), c.cacheAfter);
-        EXPECT_EQ(tp.log->countContaining(kFetchFailed), c.fetchFailures);
+        EXPECT_EQ(negotiate(policy), overlap);
+        EXPECT_EQ(cache(), cacheAfter);
+        EXPECT_EQ(tp.log->countContaining(kFetchFailed), fetchFailures);
         EXPECT_EQ(tp.log->count(std::string(" Server lookup policy:") +
-                                std::to_string(static_cast<std::uint64_t>(c.policy))),
+                                std::to_string(static_cast<std::uint64_t>(policy))),
                   1);
     }
     // Downloads still go ahead when the list cannot be fetched.

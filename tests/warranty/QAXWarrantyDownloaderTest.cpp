@@ -139,12 +139,7 @@ TEST_F(QAXWarrantyDownloaderTest, OnlyUnauthorizedIsRetriedAndFailuresKeepTheCac
     }
     deep += std::string(200, ']') + "}";
     const Answer unauthorized{401, "{}"};
-    struct Row {
-        const char* name;
-        std::deque<Answer> answers;
-        std::size_t attempts;
-        bool success;
-    } rows[] = {
+    const std::tuple<const char*, std::deque<Answer>, std::size_t, bool> rows[] = {
         {"401, 401, 200", {unauthorized, unauthorized, {200, summaryText_}}, 3, true},
         {"three 401s", {unauthorized, unauthorized, unauthorized, {200, summaryText_}}, 3, false},
         {"500 is not retried", {{500, summaryText_}, {200, summaryText_}}, 1, false},
@@ -153,20 +148,20 @@ TEST_F(QAXWarrantyDownloaderTest, OnlyUnauthorizedIsRetriedAndFailuresKeepTheCac
         {"nested too deep", {{200, deep}}, 1, false},
         {"200 without a body", {{200, ""}}, 1, false},
     };
-    for (auto& row : rows) {
-        SCOPED_TRACE(row.name);
+    for (const auto& [name, answers, attempts, success] : rows) {
+        SCOPED_TRACE(name);
         const CacheState before = seedCache(kThisDevice);
         const auto renewalsBefore = accounts->renewals().size();
         const auto postsBefore = received().size();
         tp.log->clear();
-        script(row.answers);
+        script(answers);
 
         Result result = download(kThisDevice);
-        EXPECT_EQ(result.success, row.success);
-        EXPECT_EQ(received().size() - postsBefore, row.attempts);
+        EXPECT_EQ(result.success, success);
+        EXPECT_EQ(received().size() - postsBefore, attempts);
         // Every attempt after the first is signed with a freshly provisioned token.
-        EXPECT_EQ(accounts->renewals().size() - renewalsBefore, row.attempts - 1);
-        if (row.success) {
+        EXPECT_EQ(accounts->renewals().size() - renewalsBefore, attempts - 1);
+        if (success) {
             ASSERT_TRUE(result.warranty);
             EXPECT_EQ(result.warranty->dictionaryRepresentation(), summary);
             const CacheState after = cacheState(kThisDevice);

@@ -67,16 +67,9 @@ TEST_F(QAXWarrantyTest, EpochNumbersAreSecondsUpToTenBillionAndMillisecondsAbove
 }
 
 TEST_F(QAXWarrantyTest, ConversionDateComesFromTheSettingThenTheSummaryThenTheEndDate) {
-    struct Case {
-        const char* name;
-        const char* summary;
-        std::optional<Value> conversionSetting;
-        std::optional<Value> oneDayInterval;
-        std::optional<double> expected;
-    };
     const char* kEnd = R"({"coverageEndDate": 1700000000})";
     // clang-format off
-    const Case cases[] = {
+    const std::tuple<const char*, const char*, std::optional<Value>, std::optional<Value>, std::optional<double>> cases[] = {
         {"absent: end date plus a day", kEnd, {}, {}, kNow + kDay},
         {"absent: end date plus the day length as stored", kEnd, {}, Value(3600), kNow + 3600},
         {"absent without an end date", R"({})", {}, {}, {}},
@@ -94,20 +87,20 @@ TEST_F(QAXWarrantyTest, ConversionDateComesFromTheSettingThenTheSummaryThenTheEn
          Value("1800000000"), {}, 1700500000},
     };
     // clang-format on
-    for (const auto& c : cases) {
-        SCOPED_TRACE(c.name);
+    for (const auto& [name, summary, conversionSetting, oneDayInterval, expected] : cases) {
+        SCOPED_TRACE(name);
         preferences().removeObject("ConversionDate");
         preferences().removeObject(settings::kOneDayInterval);
-        if (c.conversionSetting) {
-            preferences().setObject("ConversionDate", *c.conversionSetting);
+        if (conversionSetting) {
+            preferences().setObject("ConversionDate", *conversionSetting);
         }
-        if (c.oneDayInterval) {
-            preferences().setObject(settings::kOneDayInterval, *c.oneDayInterval);
+        if (oneDayInterval) {
+            preferences().setObject(settings::kOneDayInterval, *oneDayInterval);
         }
-        auto w = fromJson(c.summary);
+        auto w = fromJson(summary);
         ASSERT_TRUE(w);
         EXPECT_EQ(iso(w->hvOfferConversionDate()),
-                  iso(c.expected ? std::optional<Date>(Date(*c.expected)) : std::nullopt));
+                  iso(expected ? std::optional<Date>(Date(*expected)) : std::nullopt));
     }
 }
 
