@@ -47,9 +47,9 @@ TEST(PrivateLogging, NoSerialNumberInTheLogOfTheAgentsRequests) {
     auto& prefs = *env.platform->preferences;
     qax_registerDefaults(prefs);
     prefs.setObject("ServerVersionOverride",
-                    Value(Value::Dictionary{{"LowServerVersion", 2}, {"HighServerVersion", 3}}));
+                    Value::Dictionary{{"LowServerVersion", 2}, {"HighServerVersion", 3}});
     prefs.setObject("PairedWatchesSerialNumbers",
-                    Value(Value::Dictionary{{"W7PRIVATE01", "W7SUBSTITUTE"}}));
+                    Value::Dictionary{{"W7PRIVATE01", "W7SUBSTITUTE"}});
 
     auto provider = std::make_shared<test::FakeWarrantyProvider>();
     auto agent = QAXAgent::initWithWarrantyProvider(

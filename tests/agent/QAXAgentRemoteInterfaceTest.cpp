@@ -93,7 +93,7 @@ TEST_F(QAXAgentRemoteInterfaceTest, EveryOperationWithGoodAndHostileArguments) {
         {"checkIsAvailableInStore:withReply:", {Value(huge)}, wrong},
         {"appSupportAvailability:withReply:", {Value("com.velmora.support")},
          Value(Value::Dictionary{{"AppBundleID", "com.velmora.support"}}).description()},
-        {"appSupportAvailability:withReply:", {Value(Value::Array{})}, wrong},
+        {"appSupportAvailability:withReply:", {Value::Array{}}, wrong},
         {"readWebURLOverride:", {}, "none"},
         {"defaultDevice:", {}, "QAXDevice"},
         {"defaultDevice:", {Value(1)}, wrong},
@@ -151,7 +151,7 @@ TEST_F(QAXAgentRemoteInterfaceTest, ErrorsNameTheExpectedArgumentsAndNoDevicesIs
     EXPECT_TRUE(notAnAgent.reply.error);
 
     devices->watches.clear();
-    EXPECT_EQ(invoke("pairedDevices:", {}).reply.value, Value(Value::Array{}));
+    EXPECT_EQ(invoke("pairedDevices:", {}).reply.value, Value::Array{});
 }
 
 TEST_F(QAXAgentRemoteInterfaceTest, WebURLOverrideOnlyOnInternalBuilds) {

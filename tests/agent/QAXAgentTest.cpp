@@ -25,8 +25,7 @@ class QAXAgentTest : public ::testing::Test {
     QAXAgentTest() { qax_registerDefaults(*env.platform->preferences); }
 
     std::shared_ptr<QAXWarranty> warranty(const char* tag) {
-        return QAXWarranty::warrantyWithDictionary(env.platform,
-                                                   Value(Value::Dictionary{{"tag", tag}}));
+        return QAXWarranty::warrantyWithDictionary(env.platform, Value::Dictionary{{"tag", tag}});
     }
     static std::string tagOf(const std::shared_ptr<QAXWarranty>& w) {
         if (!w) {
@@ -208,10 +207,9 @@ TEST_F(QAXAgentTest, AllDevicesJoinWaitsForOverlappingCallsOnOneAgent) {
 
 TEST_F(QAXAgentTest, SerialNumberSubstitutionsWatchesWinOverAccessories) {
     env.platform->preferences->setObject("PairedWatchesSerialNumbers",
-                                         Value(Value::Dictionary{{"X", "W1"}, {"Q", "Q2"}}));
-    env.platform->preferences->setObject(
-        "PairedBluetoothDevicesSerialNumbers",
-        Value(Value::Dictionary{{"X", "ACC"}, {"A", "B"}, {"N", 7}}));
+                                         Value::Dictionary{{"X", "W1"}, {"Q", "Q2"}});
+    env.platform->preferences->setObject("PairedBluetoothDevicesSerialNumbers",
+                                         Value::Dictionary{{"X", "ACC"}, {"A", "B"}, {"N", 7}});
     provider->setDownloadResult("W1", warranty("w1"));
     const std::tuple<const char*, const char*, const char*, QAXDeviceType> rows[] = {
         {"X", "W1", "One", QAXDeviceTypeWatch},

@@ -83,8 +83,8 @@ TEST_F(ServiceDelegateTest, OnlyATrueBooleanOrNonZeroNumberIsAnEntitlement) {
         {"string YES", Value("YES"), false},
         {"string 1", Value("1"), false},
         {"date", Value(Date(1)), false},
-        {"dictionary", Value(Value::Dictionary{{"a", Value(true)}}), false},
-        {"array", Value(Value::Array{Value(true)}), false},
+        {"dictionary", Value::Dictionary{{"a", Value(true)}}, false},
+        {"array", Value::Array{Value(true)}, false},
     };
     for (const auto& [what, value, accepted] : cases) {
         env.log->clear();

@@ -61,13 +61,13 @@ TEST(QAXDeviceTest, DecodingRefusesWrongClassesAndKinds) {
         {"activation date is a string", with("activationDate", "2024-01-01")},
         {"device type is a string", with("deviceType", "1")},
         {"device type is a real", with("deviceType", 1.5)},
-        {"not a dictionary", Value(Value::Array{good})},
+        {"not a dictionary", Value::Array{good}},
     };
     for (const auto& [what, archive] : refused) {
         EXPECT_EQ(QAXDevice::decode(archive), nullptr) << what;
     }
     // Missing keys are none, and a missing type is the default one.
-    auto sparse = QAXDevice::decode(Value(Value::Dictionary{{"$class", Value("QAXDevice")}}));
+    auto sparse = QAXDevice::decode(Value::Dictionary{{"$class", Value("QAXDevice")}});
     ASSERT_NE(sparse, nullptr);
     EXPECT_FALSE(sparse->name());
     EXPECT_FALSE(sparse->activationDate());
@@ -78,7 +78,7 @@ class QAXDeviceInfoTest : public ::testing::Test {
   protected:
     std::shared_ptr<QAXWarranty> warranty(const char* offerId) {
         return QAXWarranty::initWithDictionary(
-            env.platform, Value(Value::Dictionary{{"hvOfferIdentifier", Value(offerId)}}));
+            env.platform, Value::Dictionary{{"hvOfferIdentifier", Value(offerId)}});
     }
     test::TestPlatform env;
 };

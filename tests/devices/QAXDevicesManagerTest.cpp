@@ -27,8 +27,8 @@ class QAXDevicesManagerTest : public ::testing::Test {
     }
     void serverVersions(int low, int high) {
         prefs()->setObject("ServerVersionOverride",
-                           Value(Value::Dictionary{{"LowServerVersion", Value(low)},
-                                                   {"HighServerVersion", Value(high)}}));
+                           Value::Dictionary{{"LowServerVersion", Value(low)},
+                                             {"HighServerVersion", Value(high)}});
     }
     std::vector<std::string> serials(const QAXDeviceMap& devices) {
         std::vector<std::string> out;
@@ -118,7 +118,7 @@ TEST_F(QAXDevicesManagerTest, OnlyActivePairedWatchesWithSerialNumbersAreListed)
 TEST_F(QAXDevicesManagerTest, InternalOverrideListReplacesTheRegistry) {
     registry->setDevices({test::FakePairedDeviceRegistry::watch("Real", "REAL", Date(1))});
     prefs()->setObject("PairedWatchesSerialNumbers",
-                       Value(Value::Dictionary{{"A", Value("W1")}, {"B", Value("W2")}}));
+                       Value::Dictionary{{"A", Value("W1")}, {"B", Value("W2")}});
     prefs()->setObject("W1.activationInterval", -86400);
 
     // Not internal: the override list is ignored.
@@ -133,7 +133,7 @@ TEST_F(QAXDevicesManagerTest, InternalOverrideListReplacesTheRegistry) {
     EXPECT_EQ(paired["W2"]->activationDate(), now);
     EXPECT_EQ(paired["W1"]->deviceType(), QAXDeviceTypeWatch);
 
-    prefs()->setObject("PairedWatchesSerialNumbers", Value(Value::Dictionary{}));
+    prefs()->setObject("PairedWatchesSerialNumbers", Value::Dictionary{});
     EXPECT_TRUE(manager.pairedDevices().empty()) << "an empty override hides the real watches";
 }
 

@@ -55,8 +55,8 @@ class FollowUpActivitiesTest : public ::testing::Test {
             Value::Dictionary summary{
                 {"hvLocalizedOfferPluralDescFormat", "%@ days left"},
                 {"featureToggleParameters",
-                 Value(Value::Dictionary{{"hvOfferDisplay", d.displayed},
-                                         {"hvOfferDurationDaysBeforeEndDate", 30}})}};
+                 Value::Dictionary{{"hvOfferDisplay", d.displayed},
+                                   {"hvOfferDurationDaysBeforeEndDate", 30}}}};
             for (auto [key, offset] : {std::pair{"hvOfferFollowupDisplayDate", d.display},
                                        std::pair{"hvOfferEligibleUntil", d.until}}) {
                 if (offset) {

@@ -39,8 +39,7 @@ class QAXFollowUpTest : public ::testing::Test {
             {"hvLocalizedOfferSingularDesc", "Last day to buy"},
             {"hvLocalizedOfferPluralDescFormat", "%@ days left to buy"},
             {"featureToggleParameters",
-             Value(Value::Dictionary{{"hvOfferDisplay", true},
-                                     {"hvOfferDurationDaysBeforeEndDate", 45}})},
+             Value::Dictionary{{"hvOfferDisplay", true}, {"hvOfferDurationDaysBeforeEndDate", 45}}},
         };
     }
     std::shared_ptr<QAXDeviceInfo> info(const std::optional<std::string>& serial,
@@ -111,14 +110,13 @@ TEST_F(QAXFollowUpTest, PostedItemIdentifiesAndTargetsTheDevice) {
         EXPECT_EQ(item->actions[0].identifier, "com.followup.qax_followup_open_action");
         EXPECT_FALSE(item->actions[0].url);
         EXPECT_TRUE(logged("Posted follow-up: serialNumber:" + serial + " -> success"));
-        EXPECT_EQ(analytics->events().back().payload,
-                  Value(Value::Dictionary{{"devicetype", typeText}}));
+        EXPECT_EQ(analytics->events().back().payload, Value::Dictionary{{"devicetype", typeText}});
     }
     EXPECT_EQ(analytics->events().size(), 3u);
 
     // A missing warranty, a hidden offer or a missing serial number is refused.
     auto hidden = offer(30);
-    hidden["featureToggleParameters"] = Value(Value::Dictionary{{"hvOfferDisplay", false}});
+    hidden["featureToggleParameters"] = Value::Dictionary{{"hvOfferDisplay", false}};
     followUp.postFollowUpWithDeviceInfo(info("X", std::nullopt));
     followUp.postFollowUpWithDeviceInfo(info("Y", hidden));
     followUp.postFollowUpWithDeviceInfo(info(std::nullopt, std::nullopt));
@@ -166,7 +164,7 @@ TEST_F(QAXFollowUpTest, BadgeAndNotificationFollowTheServerDurations) {
 TEST_F(QAXFollowUpTest, SetUpAgainAccumulatesBitsAndKeepsANotification) {
     auto summary = offer(10);
     summary["featureToggleParameters"] =
-        Value(Value::Dictionary{{"hvOfferDisplay", true}, {"hvOfferSettingsRowBadge", true}});
+        Value::Dictionary{{"hvOfferDisplay", true}, {"hvOfferSettingsRowBadge", true}};
     summary["hvOfferBadgeBeforeEndDate"] = Value(14);
     summary["showNotificationToggle"] = Value(true);
     summary["showNotificationBeforeEndDate"] = Value(11);
@@ -214,7 +212,7 @@ TEST_F(QAXFollowUpTest, SetUpAgainAccumulatesBitsAndKeepsANotification) {
 
 TEST_F(QAXFollowUpTest, PostRuleDecidesEachDevice) {
     auto noDisplay = offer(30);
-    noDisplay["featureToggleParameters"] = Value(Value::Dictionary{{"hvOfferDisplay", false}});
+    noDisplay["featureToggleParameters"] = Value::Dictionary{{"hvOfferDisplay", false}};
     auto noEnd = offer(30);
     noEnd.erase("hvOfferEligibleUntil");
     auto displayNow = offer(30);
@@ -320,7 +318,7 @@ TEST_F(QAXFollowUpTest, DismissalKeepsTheOfferAwayUntilANewOfferPeriod) {
 
 TEST_F(QAXFollowUpTest, RefreshUpdatesClearsAndReposts) {
     auto noDisplay = offer(30);
-    noDisplay["featureToggleParameters"] = Value(Value::Dictionary{{"hvOfferDisplay", false}});
+    noDisplay["featureToggleParameters"] = Value::Dictionary{{"hvOfferDisplay", false}};
     center->setItems(kClient, {pendingItemFor("A"), pendingItemFor("B"), pendingItemFor("C"),
                                pendingItemFor("D")});
     auto a = info("A", offer(30));
@@ -346,7 +344,7 @@ TEST_F(QAXFollowUpTest, RefreshUpdatesClearsAndReposts) {
     // A single-device refresh leaves other items alone; forced posting brings a dismissed
     // device back despite the dismissed array.
     center->setItems(kClient, {pendingItemFor("B")});
-    prefs.setObject("FollowupDismissedSerialNumberHashes", Value(Value::Array{sha256Hash("F")}));
+    prefs.setObject("FollowupDismissedSerialNumberHashes", Value::Array{sha256Hash("F")});
     result = followUp.refreshFollowupWithDeviceInfo(infos[4], true);
     EXPECT_EQ(result, QAXDeviceInfoList{infos[4]});
     EXPECT_TRUE(pending("F") && pending("B"));

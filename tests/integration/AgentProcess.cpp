@@ -54,13 +54,12 @@ void AgentProcess::registerApplication(const std::string& name, const std::strin
                                        std::optional<Value> entitlement) {
     Value::Dictionary app{{"ExecutablePath", Value(executablePath)},
                           {"Installed", Value(true)},
-                          {"Entitlements", Value(Value::Dictionary{})}};
+                          {"Entitlements", Value::Dictionary{}}};
     if (bundleIdentifier) {
         app["BundleIdentifier"] = *bundleIdentifier;
     }
     if (entitlement) {
-        app["Entitlements"] =
-            Value(Value::Dictionary{{"com.velmora.private.qaxagent", *entitlement}});
+        app["Entitlements"] = Value::Dictionary{{"com.velmora.private.qaxagent", *entitlement}};
     }
     writeRootFile("apps/" + name + ".plist", Value(std::move(app)));
 }

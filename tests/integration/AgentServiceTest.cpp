@@ -27,11 +27,10 @@ constexpr const char* kRejected =
 class AgentServiceTest : public ::testing::Test {
   protected:
     void SetUp() override {
-        agent.writeRootFile("device.plist",
-                            Value(Value::Dictionary{{"SerialNumber", Value("ITEST-SN-1")},
-                                                    {"ProductType", Value("Phone1,1")},
-                                                    {"ProductVersion", Value("1.0")},
-                                                    {"InternalBuild", Value(true)}}));
+        agent.writeRootFile("device.plist", Value::Dictionary{{"SerialNumber", Value("ITEST-SN-1")},
+                                                              {"ProductType", Value("Phone1,1")},
+                                                              {"ProductVersion", Value("1.0")},
+                                                              {"InternalBuild", Value(true)}});
         // This test process is the entitled client; it is registered outside any bundle.
         entitle(Value(true));
         ASSERT_TRUE(agent.start()) << agent.log();
@@ -135,8 +134,8 @@ TEST_F(AgentServiceTest, EntitledClientsAreServedOthersClosedAndBrokenSendersAlo
         {"over 4 MiB", bytes({0, 0x40, 0, 1})},
         {"nested 200 deep", *IpcFrameCodec::frame(deep)},
         {"request without an id",
-         *IpcFrameCodec::encode(Value(Value::Dictionary{{"op", Value("defaultDevice:")}}))},
-        {"not a dictionary", *IpcFrameCodec::encode(Value(Value::Array{Value(1)}))},
+         *IpcFrameCodec::encode(Value::Dictionary{{"op", Value("defaultDevice:")}})},
+        {"not a dictionary", *IpcFrameCodec::encode(Value::Array{Value(1)})},
     };
     int closures = 0;
     for (const auto& [what, frame] : broken) {
@@ -165,13 +164,13 @@ TEST_F(AgentServiceTest, EntitledClientsAreServedOthersClosedAndBrokenSendersAlo
     // Far more requests at once than the agent keeps in flight, one of them in XML: each is
     // answered once.
     constexpr int kRequests = 300;
-    std::string frames = *IpcFrameCodec::frame(*toXmlPlist(Value(Value::Dictionary{
-        {"id", Value(kRequests)}, {"op", Value("defaultDevice:")}, {"args", Value::Array{}}})));
+    std::string frames = *IpcFrameCodec::frame(*toXmlPlist(Value::Dictionary{
+        {"id", Value(kRequests)}, {"op", Value("defaultDevice:")}, {"args", Value::Array{}}}));
     for (int id = 1; id < kRequests; ++id) {
         frames += *IpcFrameCodec::encode(
-            Value(Value::Dictionary{{"id", Value(id)},
-                                    {"op", Value(id % 2 ? "defaultDevice:" : "pairedDevices:")},
-                                    {"args", Value(Value::Array{})}}));
+            Value::Dictionary{{"id", Value(id)},
+                              {"op", Value(id % 2 ? "defaultDevice:" : "pairedDevices:")},
+                              {"args", Value(Value::Array{})}});
     }
     ASSERT_TRUE(client->sendRaw(frames, &error)) << error;
     std::set<std::int64_t> ids;
@@ -196,14 +195,13 @@ TEST_F(AgentServiceTest, QaxctlLaunchEventsASecondAgentAndACleanStop) {
     Value::Dictionary archived = watch;
     archived["serialNumber"] = "W0";
     archived["isArchived"] = true;
-    agent.writeRootFile("paired-devices.plist", Value(Value::Array{Value(watch), Value(archived)}));
-    agent.writeRootFile("features.plist",
-                        Value(Value::Dictionary{
-                            {"Kestova", Value(Value::Dictionary{{"Tessel_3_0", Value(true)}})}}));
+    agent.writeRootFile("paired-devices.plist", Value::Array{Value(watch), Value(archived)});
+    agent.writeRootFile(
+        "features.plist",
+        Value::Dictionary{{"Kestova", Value(Value::Dictionary{{"Tessel_3_0", Value(true)}})}});
     FilePreferenceStore(FilePreferenceStore::domainPath(agent.home()))
-        .setObject("ServerVersionOverride",
-                   Value(Value::Dictionary{{"LowServerVersion", Value(2)},
-                                           {"HighServerVersion", Value(3)}}));
+        .setObject("ServerVersionOverride", Value::Dictionary{{"LowServerVersion", Value(2)},
+                                                              {"HighServerVersion", Value(3)}});
 
     auto device = agent.ctl({"default-device", "--json"});
     ASSERT_EQ(device.status, 0) << device.err;

@@ -27,10 +27,10 @@ HttpRequest summaryRequest(const std::string& base, const std::string& serial,
     HttpRequest request(base + "/api/v3/coverage/summary", timeout);
     request.setMethod("POST");
     request.setValue("X-Velmora-KF-Token", std::string("token"));
-    request.setBody(toJsonString(Value(Value::Dictionary{{"serialNumber", Value(serial)},
-                                                         {"locale", Value("en_US")},
-                                                         {"requestTimestamp", Value(1)},
-                                                         {"requestTimezone", Value("UTC")}})));
+    request.setBody(toJsonString(Value::Dictionary{{"serialNumber", Value(serial)},
+                                                   {"locale", Value("en_US")},
+                                                   {"requestTimestamp", Value(1)},
+                                                   {"requestTimezone", Value("UTC")}}));
     return request;
 }
 
@@ -97,7 +97,7 @@ TEST_F(CoverageSimScenarioTest, AnswersFollowTheScenarioThenTheService) {
         EXPECT_TRUE(status != 503 || took >= 0.3) << took;
     }
     EXPECT_EQ(sim.call("GET", "/store/lookup?bundleId=x").response->statusCode, 404);
-    EXPECT_EQ(parseJson(sim.call("GET", scenario).response->body), Value(Value::Dictionary{}))
+    EXPECT_EQ(parseJson(sim.call("GET", scenario).response->body), Value::Dictionary{})
         << "every list used up";
 
     // The log shows which answer each request got; the admin endpoints stay out of it.
@@ -161,7 +161,7 @@ TEST_F(CoverageSimScenarioTest, StoreEndpointsServeTheHostBindings) {
     EXPECT_FALSE(unknown.second);
     EXPECT_TRUE(unknown.first.empty());
     EXPECT_EQ(*sim.requestLog().back().find("query"),
-              Value(Value::Dictionary{{"bundleId", Value("a&b=c d")}}));
+              Value::Dictionary{{"bundleId", Value("a&b=c d")}});
 
     auto [bought, boughtError] = purchases(42, {"com.velmora.support"});
     ASSERT_FALSE(boughtError) << *boughtError;
@@ -192,7 +192,7 @@ TEST_F(CoverageSimScenarioTest, StoreEndpointsServeTheHostBindings) {
 
 TEST_F(CoverageSimScenarioTest, RelativeDatesFollowTheClock) {
     const std::string clockFile = root() + "/state/clock.plist";
-    writeFile(clockFile, *toXmlPlist(Value(Value::Dictionary{{"OffsetSeconds", Value(864000)}})));
+    writeFile(clockFile, *toXmlPlist(Value::Dictionary{{"OffsetSeconds", Value(864000)}}));
     CoverageSimProcess sim(state(), root(), {"--clock-offset", "86400"}, {"QAX_CLOCK=simulated"});
     ASSERT_FALSE(sim.base().empty()) << "coverage-sim did not start";
     auto eligibleUntil = [&] {
@@ -203,7 +203,7 @@ TEST_F(CoverageSimScenarioTest, RelativeDatesFollowTheClock) {
     };
     // The built-in summary's offer ends 30 days after "now".
     EXPECT_NEAR(eligibleUntil(), nowSeconds() + 86400 + 864000 + 30 * 86400, 60);
-    writeFile(clockFile, *toXmlPlist(Value(Value::Dictionary{{"OffsetSeconds", Value(-3600.5)}})));
+    writeFile(clockFile, *toXmlPlist(Value::Dictionary{{"OffsetSeconds", Value(-3600.5)}}));
     EXPECT_NEAR(eligibleUntil(), nowSeconds() + 86400 - 3600.5 + 30 * 86400, 60)
         << "the clock file is read on each request";
 }

@@ -45,7 +45,7 @@ class OfferRoadTest : public ::testing::Test {
         agent.writeDevices(kPhone, std::nullopt, "17.2");
         agent.writeRootFile(
             "features.plist",
-            Value(Value::Dictionary{{"Kestova", Value(Value::Dictionary{{"Tessel_3_0", true}})}}));
+            Value::Dictionary{{"Kestova", Value(Value::Dictionary{{"Tessel_3_0", true}})}});
         agent.writeAccounts(sim->base() + "/token");
         // qaxctl asks for an outreach as the settings application would.
         agent.registerApplication("settings", QAX_CTL_BINARY, "com.velmora.Preferences",
@@ -248,12 +248,12 @@ TEST_F(OfferRoadTest, FortyDaysOfAnOffer) {
 
     // A watch with its own offer (day 15 to 38) is paired: the post is due again on day 15.
     agent.writeRootFile("paired-devices.plist",
-                        Value(Value::Array{Value(Value::Dictionary{{"name", "Road Watch"},
-                                                                   {"localizedModel", "Watch"},
-                                                                   {"serialNumber", kWatch},
-                                                                   {"pairedDate", Value(day(-100))},
-                                                                   {"isPaired", true},
-                                                                   {"isArchived", false}})}));
+                        Value::Array{Value(Value::Dictionary{{"name", "Road Watch"},
+                                                             {"localizedModel", "Watch"},
+                                                             {"serialNumber", kWatch},
+                                                             {"pairedDate", Value(day(-100))},
+                                                             {"isPaired", true},
+                                                             {"isArchived", false}})});
     ASSERT_EQ(agent.ctl({"notify", "com.velmora.pairlink.devicedidpair"}).status, 0);
     ASSERT_TRUE(
         waitFor("Found a new followup post date trigerred after a pairing event. Schedule "

@@ -49,8 +49,8 @@ std::optional<std::string> serialIn(const Value* reply) {
 // same way, hands it to each instance and reads their readiness notices.
 TEST(OnDemandStartTest, IdleExitAndTheNextInstanceKeepStateAndALateClient) {
     test::AgentProcess agent;  // its home, platform root and environment; started here instead
-    agent.writeRootFile("device.plist", Value(Value::Dictionary{{"SerialNumber", Value("OD-1")},
-                                                                {"InternalBuild", Value(true)}}));
+    agent.writeRootFile("device.plist", Value::Dictionary{{"SerialNumber", Value("OD-1")},
+                                                          {"InternalBuild", Value(true)}});
     agent.registerApplication("tests", test::selfExecutable(), std::nullopt, Value(true));
     std::filesystem::create_directories(agent.runtimeDirectory());
     const int listening = bindUnixSocket(SOCK_STREAM, agent.socketPath());
@@ -124,8 +124,8 @@ TEST(OnDemandStartTest, UnderSystemdSocketActivateTheFirstConnectionStartsIt) {
         GTEST_SKIP() << "systemd-socket-activate (Debian package systemd) is not installed";
     }
     test::AgentProcess agent;
-    agent.writeRootFile("device.plist", Value(Value::Dictionary{{"SerialNumber", Value("OD-2")},
-                                                                {"InternalBuild", Value(true)}}));
+    agent.writeRootFile("device.plist", Value::Dictionary{{"SerialNumber", Value("OD-2")},
+                                                          {"InternalBuild", Value(true)}});
     agent.registerApplication("tests", test::selfExecutable(), std::nullopt, Value(true));
     std::filesystem::create_directories(agent.runtimeDirectory());
     std::vector<std::string> args{"-l", agent.socketPath(), "-E", "QAX_IDLE_EXIT_SECONDS=1"};

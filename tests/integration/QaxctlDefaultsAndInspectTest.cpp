@@ -37,9 +37,8 @@ TEST_F(QaxctlDefaultsAndInspect, DefaultsWriteReadDeleteAndRefuseBadInput) {
         {"-bool", "yes", "PostUpgradeActivityCompleted", Value(true)},
         {"-date", "2023-11-14T22:13:20Z", "DefaultDeviceActivationDate", Value(Date(1700000000))},
         {"-json", R"({"LowServerVersion":2,"HighServerVersion":"3"})", "ServerVersionOverride",
-         Value(Value::Dictionary{{"LowServerVersion", 2}, {"HighServerVersion", "3"}})},
-        {"-json", R"(["a","b"])", "FollowupPostedSerialNumberHashes",
-         Value(Value::Array{"a", "b"})},
+         Value::Dictionary{{"LowServerVersion", 2}, {"HighServerVersion", "3"}}},
+        {"-json", R"(["a","b"])", "FollowupPostedSerialNumberHashes", Value::Array{"a", "b"}},
     };
     for (const auto& [type, text, key, expected] : rows) {
         SCOPED_TRACE(text);

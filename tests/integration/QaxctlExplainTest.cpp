@@ -83,8 +83,7 @@ class QaxctlExplainTest : public ::testing::Test {
             "QAX_SHARE_DIR=" + std::string(QAX_SOURCE_DIR) + "/share/qaxagent"};
         agent.writeDevices(kPhone, std::nullopt, "17.2");
         agent.writeAccounts();
-        agent.writeRootFile("locale.plist",
-                            Value(Value::Dictionary{{"PreferredLocale", Value("en_US")}}));
+        agent.writeRootFile("locale.plist", Value::Dictionary{{"PreferredLocale", Value("en_US")}});
         // This boot and this system version are behind the agent already: its start-up runs
         // no upgrade or boot work, only what is registered.
         ASSERT_TRUE(HostActivityTriggerRecord::save(
@@ -112,7 +111,7 @@ class QaxctlExplainTest : public ::testing::Test {
         auto ms = [&](double days) {
             return Value(static_cast<std::int64_t>((start + days * kDay) * 1000));
         };
-        return Value(Value::Dictionary{
+        return Value::Dictionary{
             {"covered", true},
             {"hvOfferEligible", true},
             {"hvOfferEligibleUntil", ms(endsInDays)},
@@ -130,7 +129,7 @@ class QaxctlExplainTest : public ::testing::Test {
                                      {"hvOfferDurationDaysBeforeEndDate", 30}})},
             {"hvOfferBadgeBeforeEndDate", 7},
             {"showNotificationToggle", true},
-            {"showNotificationBeforeEndDate", 3}});
+            {"showNotificationBeforeEndDate", 3}};
     }
 
     // The cache file and its keys, as a download leaves them.
@@ -307,8 +306,7 @@ TEST_F(QaxctlExplainTest, DismissalConversionAndActivationAgreeWithThePostRule) 
         }
         prefs.removeObject(hash + ".dismissed");
         if (row.dismissedDaysAgo >= 0) {
-            prefs.setObject("FollowupDismissedSerialNumberHashes",
-                            Value(Value::Array{Value(hash)}));
+            prefs.setObject("FollowupDismissedSerialNumberHashes", Value::Array{Value(hash)});
             prefs.setObject(hash + ".dismissed", Value(Date(start - row.dismissedDaysAgo * kDay)));
         }
         prefs.setObject("DefaultDeviceActivationDate",

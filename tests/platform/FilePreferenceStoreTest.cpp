@@ -91,7 +91,7 @@ TEST_F(FilePreferenceStoreTest, WithinASnapshotScopeFilesAreLookedAtOnce) {
     const std::string device = env.home.str() + "/device.plist";
     CachedPlistFile deviceFile(device);
     ASSERT_TRUE(engineer.setObject("SerialNumber", Value("FIRST")));
-    writeFile(device, *toXmlPlist(Value(Value::Dictionary{{"SerialNumber", "FIRST"}})));
+    writeFile(device, *toXmlPlist(Value::Dictionary{{"SerialNumber", "FIRST"}}));
     auto serials = [&] {
         auto root = deviceFile.read();
         const Value* serial = root ? root->find("SerialNumber") : nullptr;
@@ -102,7 +102,7 @@ TEST_F(FilePreferenceStoreTest, WithinASnapshotScopeFilesAreLookedAtOnce) {
         FileSnapshotScope request;
         EXPECT_EQ(serials(), std::make_pair(std::string("FIRST"), std::string("FIRST")));
         ASSERT_TRUE(engineer.setObject("SerialNumber", Value("SECOND")));
-        writeFile(device, *toXmlPlist(Value(Value::Dictionary{{"SerialNumber", "SECOND"}})));
+        writeFile(device, *toXmlPlist(Value::Dictionary{{"SerialNumber", "SECOND"}}));
         EXPECT_EQ(serials(), std::make_pair(std::string("FIRST"), std::string("FIRST")));
         // The store's own writes are seen at once.
         ASSERT_TRUE(agent.setObject("SerialNumber", Value("OWN")));
@@ -160,14 +160,14 @@ TEST_F(FilePreferenceStoreTest, CorruptDomainIsReportedReadAsEmptyAndKeptUntilTh
         ASSERT_TRUE(store.setObject("SerialNumber", Value("C02NEW")));
         auto onDisk = parsePlist(readFile(path));
         ASSERT_TRUE(onDisk);
-        EXPECT_EQ(*onDisk, Value(Value::Dictionary{{"SerialNumber", Value("C02NEW")}}));
+        EXPECT_EQ(*onDisk, Value::Dictionary{{"SerialNumber", Value("C02NEW")}});
     }
 }
 
 TEST_F(FilePreferenceStoreTest, ValuesWithoutPropertyListFormAreRefused) {
     FilePreferenceStore store(path);
     ASSERT_TRUE(store.setObject("Keep", Value(1)));
-    EXPECT_FALSE(store.setObject("Bad", Value(Value::Array{Value(), Value(1)})));
+    EXPECT_FALSE(store.setObject("Bad", Value::Array{Value(), Value(1)}));
     EXPECT_FALSE(store.objectForKey("Bad"));
     EXPECT_EQ(store.integerForKey("Keep"), 1);
 }

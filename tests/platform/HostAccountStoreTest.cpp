@@ -28,20 +28,20 @@ constexpr const char* kService = "com.velmora.kf.supportapp.auth";
 
 Value accountsFile(std::optional<std::string> tokenServiceURL,
                    std::optional<std::string> token = std::nullopt) {
-    Value::Dictionary kf{{"altDSID", "kf-alt"}, {"Tokens", Value(Value::Dictionary{})}};
+    Value::Dictionary kf{{"altDSID", "kf-alt"}, {"Tokens", Value::Dictionary{}}};
     if (token) {
         kf["Tokens"][kService] = Value(*token);
     }
     if (tokenServiceURL) {
         kf["TokenServiceURL"] = Value(*tokenServiceURL);
     }
-    return Value(Value::Dictionary{
+    return Value::Dictionary{
         {"PrimaryCloudAccount", Value(Value::Dictionary{{"altDSID", "primary-alt"}})},
         {"KFAccount", Value(std::move(kf))},
         {"StoreAccount",
          Value(Value::Dictionary{{"storefront", "143441-1,29"}, {"accountID", 42}})},
         {"IdentityHeaders", Value(Value::Dictionary{{"X-Extra", "yes"}, {"X-Number", 5}})},
-    });
+    };
 }
 
 struct Renewal {
@@ -111,7 +111,7 @@ TEST_F(HostAccountStoreTest, AccountsFromTheFile) {
     EXPECT_NE(thread, std::this_thread::get_id());
 
     Value accounts = accountsFile(std::nullopt);
-    accounts["SilentAuthStoreAccount"] = Value(Value::Dictionary{{"storefront", "silent-front"}});
+    accounts["SilentAuthStoreAccount"] = Value::Dictionary{{"storefront", "silent-front"}};
     accounts.asDictionary()->erase("StoreAccount");
     accounts.asDictionary()->erase("KFAccount");
     write(accounts);
@@ -176,9 +176,8 @@ TEST_F(HostAccountStoreTest, SigningRenewsThroughTheTokenService) {
     EXPECT_EQ(request.valueForHeader("X-Velmora-KF-Token"), "server-token-1");
     EXPECT_EQ(storedToken(), "server-token-1");
     ASSERT_EQ(server.requests().size(), 1u);
-    EXPECT_EQ(
-        parseJson(server.requests()[0].body),
-        Value(Value::Dictionary{{"altDSID", "kf-alt"}, {"services", Value::Array{kService}}}));
+    EXPECT_EQ(parseJson(server.requests()[0].body),
+              Value::Dictionary{{"altDSID", "kf-alt"}, {"services", Value::Array{kService}}});
     // A stored token needs no renewal unless forced.
     HttpRequest second("https://coverage.example/");
     ASSERT_TRUE(qax_signWithAccountHeaders(second, *tp.platform, false, true, "com.example.app"));

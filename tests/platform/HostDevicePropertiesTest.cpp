@@ -72,15 +72,15 @@ TEST(HostDevicePropertiesTest, DevicePlistDescribesTheSimulatedDevice) {
     HostDeviceProperties props(dir.str(), (dir.path() / "os-release").string(),
                                (dir.path() / "dmi").string());
 
-    auto device = toXmlPlist(Value(Value::Dictionary{
-        {"SerialNumber", "C02DEMO"}, {"ProductType", "Model9,1"}, {"InternalBuild", true}}));
+    auto device = toXmlPlist(Value::Dictionary{
+        {"SerialNumber", "C02DEMO"}, {"ProductType", "Model9,1"}, {"InternalBuild", true}});
     writeFile(dir.path() / "device.plist", *device);
     EXPECT_EQ(props.copyDeviceProperty("SerialNumber"), Value("C02DEMO"));
     EXPECT_EQ(props.copyDeviceProperty("ProductType"), Value("Model9,1"));
     EXPECT_EQ(props.copyDeviceProperty("ProductVersion"), Value("12")) << "the machine's";
     EXPECT_TRUE(props.isInternalBuild());
 
-    writeFile(dir.path() / "device.plist", *toXmlPlist(Value(Value::Dictionary{})));
+    writeFile(dir.path() / "device.plist", *toXmlPlist(Value::Dictionary{}));
     EXPECT_FALSE(props.copyDeviceProperty("SerialNumber")) << "never the machine's serial";
     EXPECT_EQ(props.copyDeviceProperty("ProductType"), Value("ThinkBox X1"));
 

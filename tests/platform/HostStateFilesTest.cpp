@@ -172,13 +172,13 @@ TEST(HostAnalyticsSink, AppendsEventsUnlessTurnedOff) {
     int built = 0;
     auto payload = [&] {
         ++built;
-        return Value(Value::Dictionary{{"devicetype", "Watch"}});
+        return Value::Dictionary{{"devicetype", "Watch"}};
     };
     sink.sendEventLazily("com.velmora.kestova.followupDisplayCount", payload);
     EXPECT_EQ(parseJson(readFile(HostAnalyticsSink::eventsPath(root.str()))),
-              Value(Value::Dictionary{{"time", "2023-11-14T22:13:20.000Z"},
-                                      {"event", "com.velmora.kestova.followupDisplayCount"},
-                                      {"payload", Value::Dictionary{{"devicetype", "Watch"}}}}));
+              Value::Dictionary{{"time", "2023-11-14T22:13:20.000Z"},
+                                {"event", "com.velmora.kestova.followupDisplayCount"},
+                                {"payload", Value::Dictionary{{"devicetype", "Watch"}}}});
     writeFile(root.path() / "analytics.plist", xmlPlist("<dict><key>Enabled</key><false/></dict>"));
     sink.sendEventLazily("e", payload);
     EXPECT_EQ(built, 1) << "the payload is never built while the sink is off";

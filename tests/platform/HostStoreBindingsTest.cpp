@@ -56,8 +56,7 @@ TEST(HostStoreBindings, FailuresCompleteOnceWithAReason) {
             return;
         }
         test::writeFile(
-            path,
-            *toXmlPlist(Value(Value::Dictionary{{"LookupURL", *url}, {"PurchasesURL", *url}})));
+            path, *toXmlPlist(Value::Dictionary{{"LookupURL", *url}, {"PurchasesURL", *url}}));
     };
 
     const std::string unreachable =

@@ -49,10 +49,10 @@ class OutreachTest : public ::testing::Test {
     }
     std::shared_ptr<QAXWarranty> warranty(const Download& d) {
         Value::Array toggle(d.toggle.begin(), d.toggle.end());
-        Value::Dictionary summary{{"featureToggleParameters",
-                                   Value(Value::Dictionary{{"hvOfferDisplay", d.displayed},
-                                                           {"hvOfferDurationDaysBeforeEndDate", 30},
-                                                           {"hvOfferToggle", Value(toggle)}})}};
+        Value::Dictionary summary{
+            {"featureToggleParameters", Value::Dictionary{{"hvOfferDisplay", d.displayed},
+                                                          {"hvOfferDurationDaysBeforeEndDate", 30},
+                                                          {"hvOfferToggle", Value(toggle)}}}};
         for (auto [key, days] : {std::pair{"hvOfferFollowupDisplayDate", d.display},
                                  std::pair{"hvOfferEligibleUntil", d.until}}) {
             if (days) {

@@ -211,7 +211,7 @@ TEST_F(QAXSchedulerTest, ClearRemovesOnlyTargetDates) {
     prefs.setObject("something.else.TargetDate", Value(tp.clock->now()));
     prefs.setObject("TargetDate", Value(1));
     prefs.setObject("com.velmora.qaxagent.outreach.TargetDate.old", Value(1));
-    prefs.setObject("FollowupPostedSerialNumberHashes", Value(Value::Array{"abc"}));
+    prefs.setObject("FollowupPostedSerialNumberHashes", Value::Array{"abc"});
 
     QAXScheduler::clearScheduledActivities(*tp.platform);
 

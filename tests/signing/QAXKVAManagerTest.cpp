@@ -394,13 +394,13 @@ TEST(HostAttestationServiceTest, PlatformFileControlsSupportAndFirstIssuance) {
     const auto file = std::filesystem::path(tp.platform->platformRoot) / "attestation.plist";
     EXPECT_TRUE(service->isAttestationSupported()) << "no file: supported";
 
-    test::writeFile(file, *toXmlPlist(Value(Value::Dictionary{{"Supported", false}})));
+    test::writeFile(file, *toXmlPlist(Value::Dictionary{{"Supported", false}}));
     EXPECT_FALSE(service->isAttestationSupported());
     HttpRequest none("https://coverage.example/");
     addKVAAuthenticationHeadersWithBody(none, *tp.platform, kBody);
     EXPECT_FALSE(none.valueForHeader("X-Velmora-Kva"));
 
-    test::writeFile(file, *toXmlPlist(Value(Value::Dictionary{{"FirstIssuanceErrorCode", -11}})));
+    test::writeFile(file, *toXmlPlist(Value::Dictionary{{"FirstIssuanceErrorCode", -11}}));
     HttpRequest fallback("https://coverage.example/");
     addKVAAuthenticationHeadersWithBody(fallback, *tp.platform, kBody);
     EXPECT_TRUE(fallback.valueForHeader("X-Velmora-Kva"));
@@ -413,7 +413,7 @@ TEST(HostAttestationServiceTest, PlatformFileControlsSupportAndFirstIssuance) {
     ASSERT_TRUE(level);
     EXPECT_EQ(*level->find("level"), Value("SVXT"));
 
-    test::writeFile(file, *toXmlPlist(Value(Value::Dictionary{{"FirstIssuanceErrorCode", -2}})));
+    test::writeFile(file, *toXmlPlist(Value::Dictionary{{"FirstIssuanceErrorCode", -2}}));
     HttpRequest failed("https://coverage.example/");
     addKVAAuthenticationHeadersWithBody(failed, *tp.platform, kBody);
     EXPECT_FALSE(failed.valueForHeader("X-Velmora-Kva"));

@@ -91,10 +91,10 @@ TEST_F(QAXServerVersionUtilitiesTest, OverlapOfTheEndPointsDecidesSupportAndTheH
              "Server versions '{(3, 5)}'"},
             {"other keys are kept", withExtraKey, QAXVersionSet{2, 3}, true,
              "Client versions '{(2, 3)}'"},
-            {"no high version", Value(Value::Dictionary{{"LowServerVersion", 2}}), std::nullopt,
-             false, "Server version dictionary missing key 'HighServerVersion'"},
-            {"no low version", Value(Value::Dictionary{{"HighServerVersion", 3}}), std::nullopt,
-             false, "Server version dictionary missing key 'LowServerVersion'"},
+            {"no high version", Value::Dictionary{{"LowServerVersion", 2}}, std::nullopt, false,
+             "Server version dictionary missing key 'HighServerVersion'"},
+            {"no low version", Value::Dictionary{{"HighServerVersion", 3}}, std::nullopt, false,
+             "Server version dictionary missing key 'LowServerVersion'"},
         };
     for (const auto& [name, list, overlap, enabled, message] : cases) {
         SCOPED_TRACE(name);
@@ -119,7 +119,7 @@ TEST_F(QAXServerVersionUtilitiesTest, OverlapOfTheEndPointsDecidesSupportAndTheH
 
 TEST_F(QAXServerVersionUtilitiesTest, AListThatIsNotADictionaryIsFetchedOnceMoreBypassingTheCache) {
     constexpr const char* kRetrying = "Incorrect format in response detected. retrying...";
-    const std::string array = *toXmlPlist(Value(Value::Array{2, 3}));
+    const std::string array = *toXmlPlist(Value::Array{2, 3});
     const std::string abort =
         "Incorrect format in response detected from URL '" + server.url(kListPath) +
         "'. Response: " + Value(Value::Array{2, 3}).description() + ". Aborting without retry.";

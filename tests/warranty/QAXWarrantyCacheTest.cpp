@@ -15,7 +15,7 @@ namespace {
 namespace fs = std::filesystem;
 
 Value summary(const std::string& label) {
-    return Value(Value::Dictionary{
+    return Value::Dictionary{
         {"covered", true},
         {"coverageEndDate", 1700000000},
         {"coverageLocalizedLabel", Value(label)},
@@ -24,7 +24,7 @@ Value summary(const std::string& label) {
                                  {"hvOfferToggle", Value(Value::Array{"310-260", "311-480"})}})},
         {"price", 3.5},
         {"when", Value(Date(1700000123.0))},
-    });
+    };
 }
 
 class QAXWarrantyCacheTest : public ::testing::Test {
@@ -101,7 +101,7 @@ TEST_F(QAXWarrantyCacheTest, EachReadGetsWhatIsOnDiskThen) {
     const std::tuple<const char*, std::string, bool, std::optional<Value>> rows[] = {
         {"rewritten in place", *toXmlPlist(summary("bbbb")), true, summary("bbbb")},
         {"replaced by rename", *toXmlPlist(summary("aaaa")), false, summary("aaaa")},
-        {"array root", *toXmlPlist(Value(Value::Array{Value("a")})), true, std::nullopt},
+        {"array root", *toXmlPlist(Value::Array{Value("a")}), true, std::nullopt},
         {"string root", *toXmlPlist(Value("text")), false, std::nullopt},
         {"not a property list", "<html>oops</html>", true, std::nullopt},
         {"empty file", "", true, std::nullopt},
@@ -127,12 +127,12 @@ TEST_F(QAXWarrantyCacheTest, EachReadGetsWhatIsOnDiskThen) {
 TEST_F(QAXWarrantyCacheTest, NullsAreAbsentValuesAndAFailedWriteKeepsThePreviousFile) {
     // A null means "absent": the record leaves it out, so it caches and reads back.
     Value withNull = summary("nulls");
-    withNull["coverage"] = Value(Value::Dictionary{{"nested", Value(nullptr)}, {"kept", 1}});
-    withNull["list"] = Value(Value::Array{Value(nullptr), Value("x")});
+    withNull["coverage"] = Value::Dictionary{{"nested", Value(nullptr)}, {"kept", 1}};
+    withNull["list"] = Value::Array{Value(nullptr), Value("x")};
     ASSERT_TRUE(make(withNull)->cacheWarranty("S"));
     Value expected = summary("nulls");
-    expected["coverage"] = Value(Value::Dictionary{{"kept", 1}});
-    expected["list"] = Value(Value::Array{Value("x")});
+    expected["coverage"] = Value::Dictionary{{"kept", 1}};
+    expected["list"] = Value::Array{Value("x")};
     EXPECT_EQ(
         QAXWarranty::cachedWarrantyForSerialNumber(tp.platform, "S")->dictionaryRepresentation(),
         expected);

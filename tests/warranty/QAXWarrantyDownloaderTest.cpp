@@ -34,7 +34,7 @@ constexpr const char* kFailed = "qaxagent failed to load warranty";
 constexpr const char* kCaller = "com.example.caller";
 
 Value versionList(int low, int high) {
-    return Value(Value::Dictionary{{"LowServerVersion", low}, {"HighServerVersion", high}});
+    return Value::Dictionary{{"LowServerVersion", low}, {"HighServerVersion", high}};
 }
 
 class QAXWarrantyDownloaderTest : public ::testing::Test {
@@ -114,7 +114,7 @@ class QAXWarrantyDownloaderTest : public ::testing::Test {
                 prefs().objectForKey(h + "_CachedWarrantyVersion")};
     }
     CacheState seedCache(const std::string& serial) {
-        QAXWarranty::warrantyWithDictionary(tp.platform, Value(Value::Dictionary{{"old", true}}))
+        QAXWarranty::warrantyWithDictionary(tp.platform, Value::Dictionary{{"old", true}})
             ->cacheWarranty(serial);
         const std::string h = sha256Hash(serial);
         prefs().setObject(h + "_CachedWarrantyLastUpdatedDate", Value(Date(1000)));
@@ -255,7 +255,7 @@ TEST_F(QAXWarrantyDownloaderTest, LocalFilesPreferThePerSerialFile) {
          "contains no plist data"},
         {"not a property list", base, std::nullopt, std::nullopt, "{\"json\": true}", std::nullopt,
          "Error serializing plist file from URL '" + base + "': "},
-        {"an array", base, Value(Value::Array{1, 2}), std::nullopt, "", std::nullopt, kFailed},
+        {"an array", base, Value::Array{1, 2}, std::nullopt, "", std::nullopt, kFailed},
     };
     // clang-format on
     for (const auto& row : rows) {
