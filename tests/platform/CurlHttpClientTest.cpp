@@ -152,38 +152,31 @@ TEST(CurlHttpClientTest, TransportFailuresComeBackAsErrors) {
                     "<key>ExtraCAFile</key><string>ca.pem</string></dict></plist>");
     test::TempDir emptyRoot;
 
-    struct Case {
-        const char* name;
-        CurlHttpClient::Options options;
-        std::string url;
-        double timeout;
-        bool succeeds;
-        const char* errorFragment;
-    };
     CurlHttpClient::Options strangerCA;
     strangerCA.extraCAFile = stranger.caFile();
-    const Case cases[] = {
-        {"tls.plist names the CA", CurlHttpClient::optionsForPlatformRoot(root.str()),
-         server.url("/ok"), 10, true, ""},
-        {"tls.plist names the CA relative to the root",
-         CurlHttpClient::optionsForPlatformRoot(relativeRoot.str()), server.url("/ok"), 10, true,
-         ""},
-        {"system CAs only", CurlHttpClient::optionsForPlatformRoot(emptyRoot.str()),
-         server.url("/ok"), 10, false, "SSL"},
-        {"another CA", strangerCA, server.url("/ok"), 10, false, "SSL"},
-        {"nothing listens", trusting(server),
-         "https://127.0.0.1:" + std::to_string(test::unusedLocalPort()) + "/ok", 10, false,
-         "connect"},
-        {"time-out", trusting(server), server.url("/slow"), 0.3, false, "Timeout"},
-        {"not a URL", trusting(server), "not a url at all", 10, false, ""},
-    };
-    for (const auto& c : cases) {
-        SCOPED_TRACE(c.name);
-        CurlHttpClient client(c.options);
-        auto result = sendAndWait(client, HttpRequest(c.url, c.timeout));
-        EXPECT_EQ(result.response.has_value(), c.succeeds) << result.error;
-        EXPECT_EQ(result.error.empty(), c.succeeds) << result.error;
-        EXPECT_NE(result.error.find(c.errorFragment), std::string::npos) << result.error;
+    const std::tuple<const char*, CurlHttpClient::Options, std::string, double, bool, const char*>
+        cases[] = {
+            {"tls.plist names the CA", CurlHttpClient::optionsForPlatformRoot(root.str()),
+             server.url("/ok"), 10, true, ""},
+            {"tls.plist names the CA relative to the root",
+             CurlHttpClient::optionsForPlatformRoot(relativeRoot.str()), server.url("/ok"), 10,
+             true, ""},
+            {"system CAs only", CurlHttpClient::optionsForPlatformRoot(emptyRoot.str()),
+             server.url("/ok"), 10, false, "SSL"},
+            {"another CA", strangerCA, server.url("/ok"), 10, false, "SSL"},
+            {"nothing listens", trusting(server),
+             "https://127.0.0.1:" + std::to_string(test::unusedLocalPort()) + "/ok", 10, false,
+             "connect"},
+            {"time-out", trusting(server), server.url("/slow"), 0.3, false, "Timeout"},
+            {"not a URL", trusting(server), "not a url at all", 10, false, ""},
+        };
+    for (const auto& [name, options, url, timeout, succeeds, errorFragment] : cases) {
+        SCOPED_TRACE(name);
+        CurlHttpClient client(options);
+        auto result = sendAndWait(client, HttpRequest(url, timeout));
+        EXPECT_EQ(result.response.has_value(), succeeds) << result.error;
+        EXPECT_EQ(result.error.empty(), succeeds) << result.error;
+        EXPECT_NE(result.error.find(errorFragment), std::string::npos) << result.error;
     }
     gate.release();
 }
