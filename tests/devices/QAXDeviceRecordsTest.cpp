@@ -90,25 +90,23 @@ TEST_F(QAXDeviceInfoTest, EqualityNeedsTheSameDeviceObjectAndEqualWarranties) {
     auto sameSummary = warranty("offer-1");
     auto other = warranty("offer-2");
 
-    struct Case {
-        const char* what;
-        std::shared_ptr<QAXDeviceInfo> lhs, rhs;
-        bool equal;
-    };
-    const Case cases[] = {
-        {"shared device, equal warranties", QAXDeviceInfo::deviceInfoWithDevice(device, a),
-         QAXDeviceInfo::deviceInfoWithDevice(device, sameSummary), true},
-        {"shared device, different warranties", QAXDeviceInfo::deviceInfoWithDevice(device, a),
-         QAXDeviceInfo::deviceInfoWithDevice(device, other), false},
-        {"equal-looking devices built separately", QAXDeviceInfo::deviceInfoWithDevice(device, a),
-         QAXDeviceInfo::deviceInfoWithDevice(twin, a), false},
-        {"both warranties none", QAXDeviceInfo::deviceInfoWithDevice(device, nullptr),
-         QAXDeviceInfo::deviceInfoWithDevice(device, nullptr), false},
-        {"no devices", QAXDeviceInfo::deviceInfoWithDevice(nullptr, a),
-         QAXDeviceInfo::deviceInfoWithDevice(nullptr, a), false},
-    };
-    for (const auto& c : cases) {
-        EXPECT_EQ(c.lhs->isEqual(c.rhs.get()), c.equal) << c.what;
+    const std::tuple<const char*, std::shared_ptr<QAXDeviceInfo>, std::shared_ptr<QAXDeviceInfo>,
+                     bool>
+        cases[] = {
+            {"shared device, equal warranties", QAXDeviceInfo::deviceInfoWithDevice(device, a),
+             QAXDeviceInfo::deviceInfoWithDevice(device, sameSummary), true},
+            {"shared device, different warranties", QAXDeviceInfo::deviceInfoWithDevice(device, a),
+             QAXDeviceInfo::deviceInfoWithDevice(device, other), false},
+            {"equal-looking devices built separately",
+             QAXDeviceInfo::deviceInfoWithDevice(device, a),
+             QAXDeviceInfo::deviceInfoWithDevice(twin, a), false},
+            {"both warranties none", QAXDeviceInfo::deviceInfoWithDevice(device, nullptr),
+             QAXDeviceInfo::deviceInfoWithDevice(device, nullptr), false},
+            {"no devices", QAXDeviceInfo::deviceInfoWithDevice(nullptr, a),
+             QAXDeviceInfo::deviceInfoWithDevice(nullptr, a), false},
+        };
+    for (const auto& [what, lhs, rhs, equal] : cases) {
+        EXPECT_EQ(lhs->isEqual(rhs.get()), equal) << what;
     }
     auto info = QAXDeviceInfo::deviceInfoWithDevice(device, a);
     EXPECT_FALSE(info->isEqual(nullptr));

@@ -215,36 +215,31 @@ TEST_F(FollowUpActivitiesTest, RunsPostRefreshAndScheduleWhatComesNext) {
 }
 
 TEST_F(FollowUpActivitiesTest, PostRunIsReportedOnceWhicheverPathEndsIt) {
-    struct Row {
-        const char* what;
-        bool shouldDefer, timerFirst;
-        std::int64_t reported;
-    };
-    const Row rows[] = {
+    const std::tuple<const char*, bool, bool, std::int64_t> rows[] = {
         {"deferral check first", true, true, QAXActivityResultDeferred},
         {"reply first", true, false, QAXActivityResultFinished},
         {"the platform does not ask to defer", false, true, QAXActivityResultFinished},
     };
-    for (const Row& row : rows) {
-        SCOPED_TRACE(row.what);
+    for (const auto& [what, shouldDefer, timerFirst, reported] : rows) {
+        SCOPED_TRACE(what);
         tp.log->clear();
         std::static_pointer_cast<test::FakeBackgroundActivityScheduler>(tp.platform->activities)
             ->activity(kPost)
-            ->setShouldDefer(row.shouldDefer);
+            ->setShouldDefer(shouldDefer);
         agent->setInfos(infos({{"A", -10 * kDay, -kDay, 30 * kDay}}));
         agent->hold(true);
         auto activity = std::make_shared<QAXFollowUpPost>(tp.platform);
         activity->setDeferralCheckInterval(10);
         auto results = run(activity);
         EXPECT_TRUE(activity->followUpPostInProgress());
-        if (row.timerFirst) {
+        if (timerFirst) {
             tp.runner->advanceBy(35);
         }
         EXPECT_EQ(agent->release(), 1u);
         tp.runner->advanceBy(35);
-        EXPECT_EQ(*results, std::vector<std::int64_t>{row.reported});
+        EXPECT_EQ(*results, std::vector<std::int64_t>{reported});
         EXPECT_EQ(tp.log->count("FollowUp Post activity deferred."),
-                  row.reported == QAXActivityResultDeferred ? 1 : 0);
+                  reported == QAXActivityResultDeferred ? 1 : 0);
         // The reply's work is done either way, and the run leaves nothing behind.
         EXPECT_EQ(items(), 1u);
         EXPECT_FALSE(activity->followUpPostInProgress() || activity->followUpPostTimer());

@@ -243,25 +243,23 @@ TEST_F(QaxctlExplainTest, PredictsWhatTheAgentsRefreshDoes) {
 
     // Past the badge date: explain says a refresh turns the badge on, and the agent's refresh
     // does, then schedules the next refresh when explain said it would.
-    struct Step {
-        Date to;
-        bool badge, notification;
-    } steps[] = {{badgeOn->byAdding(60), true, false}, {notificationOn->byAdding(60), true, true}};
-    for (const auto& step : steps) {
-        SCOPED_TRACE(step.to.description());
-        advanceTo(step.to);
+    const std::tuple<Date, bool, bool> steps[] = {{badgeOn->byAdding(60), true, false},
+                                                  {notificationOn->byAdding(60), true, true}};
+    for (const auto& [to, badge, notification] : steps) {
+        SCOPED_TRACE(to.description());
+        advanceTo(to);
         x = explain();
-        EXPECT_EQ(at(x, "offer.badge.on").truthy(), step.badge);
-        EXPECT_EQ(at(x, "offer.notification.on").truthy(), step.notification);
-        expectAt(x, {{"refresh.updatesThisDevice", true}, {"refresh.item.badge", step.badge}});
+        EXPECT_EQ(at(x, "offer.badge.on").truthy(), badge);
+        EXPECT_EQ(at(x, "offer.notification.on").truthy(), notification);
+        expectAt(x, {{"refresh.updatesThisDevice", true}, {"refresh.item.badge", badge}});
         const auto next = dateAt(x, "refresh.nextRefreshDate");
         ASSERT_TRUE(next);
         registerRefreshNow();
         runAgentRefresh();
         const Value item = followUp();
         ASSERT_TRUE(item.isDictionary()) << agent.log();
-        EXPECT_EQ(*item.find("badge"), Value(step.badge)) << item.description();
-        EXPECT_EQ(item.find("notification") != nullptr, step.notification) << item.description();
+        EXPECT_EQ(*item.find("badge"), Value(badge)) << item.description();
+        EXPECT_EQ(item.find("notification") != nullptr, notification) << item.description();
         EXPECT_EQ(*item.find("dayText"), at(x, "refresh.item.dayText"));
         // The platform keeps whole seconds of the delay.
         const auto due = refreshDue();

@@ -232,26 +232,21 @@ TEST(HostBackgroundActivityScheduler, LaunchTriggersFireOncePerBootAndPerNewVers
         }
         h.env.runner->advanceBy(120);
     };
-    struct Step {
-        const char* name;
-        const char* bootId;
-        const char* version;
-        int boots, upgrades;
-    } steps[] = {
+    const std::tuple<const char*, const char*, const char*, int, int> steps[] = {
         {"first start", "boot-1", "4.2", 1, 1},
         {"restart, same boot", "boot-1", "4.2", 1, 1},
         {"reboot", "boot-2", "4.2", 2, 1},
         {"upgrade", "boot-2", "4.3", 2, 2},
         {"back to a version seen before", "boot-2", "4.2", 2, 2},
     };
-    for (const auto& s : steps) {
-        SCOPED_TRACE(s.name);
-        h.setBootId(s.bootId);
-        device.set("ProductVersion", Value(s.version));
+    for (const auto& [name, bootId, version, boots, upgrades] : steps) {
+        SCOPED_TRACE(name);
+        h.setBootId(bootId);
+        device.set("ProductVersion", Value(version));
         h.restart();
         attachAll();
-        EXPECT_EQ(count["boot"], s.boots);
-        EXPECT_EQ(count["upgrade"], s.upgrades);
+        EXPECT_EQ(count["boot"], boots);
+        EXPECT_EQ(count["upgrade"], upgrades);
     }
     // The interval activity fired on its first attach, then every hour of platform time.
     const int before = count["hourly"];

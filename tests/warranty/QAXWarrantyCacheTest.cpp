@@ -148,37 +148,35 @@ TEST_F(QAXWarrantyCacheTest, NullsAreAbsentValuesAndAFailedWriteKeepsThePrevious
 TEST_F(QAXWarrantyCacheTest, LegacyMigration) {
     const std::string hash = sha256Hash("C02SERIAL");
     const Value date(Date(1690000000.0));
-    struct Row {
-        const char* name;
-        bool legacyFile;
-        std::optional<Value> lastUpdated, locale, version;
-    } rows[] = {
-        {"no legacy file", false, date, Value("en_US"), Value("2")},
-        {"file and all three keys", true, date, Value("en_US"), Value("2")},
-        {"file and only the version", true, std::nullopt, std::nullopt, Value("2")},
-        {"file and no keys", true, std::nullopt, std::nullopt, std::nullopt},
-    };
+    const std::tuple<const char*, bool, std::optional<Value>, std::optional<Value>,
+                     std::optional<Value>>
+        rows[] = {
+            {"no legacy file", false, date, Value("en_US"), Value("2")},
+            {"file and all three keys", true, date, Value("en_US"), Value("2")},
+            {"file and only the version", true, std::nullopt, std::nullopt, Value("2")},
+            {"file and no keys", true, std::nullopt, std::nullopt, std::nullopt},
+        };
     const char* names[] = {"CachedWarrantyLastUpdatedDate", "CachedWarrantyLocale",
                            "CachedWarrantyVersion"};
-    for (const auto& row : rows) {
-        SCOPED_TRACE(row.name);
+    for (const auto& [name, legacyFile, lastUpdated, locale, version] : rows) {
+        SCOPED_TRACE(name);
         test::TestPlatform local;
         auto& prefs = static_cast<test::InMemoryPreferenceStore&>(*local.platform->preferences);
-        const std::optional<Value>* values[] = {&row.lastUpdated, &row.locale, &row.version};
+        const std::optional<Value>* values[] = {&lastUpdated, &locale, &version};
         for (int i = 0; i < 3; ++i) {
             if (*values[i]) {
                 prefs.setObject(names[i], **values[i]);
             }
         }
         auto legacy = QAXWarranty::initWithDictionary(local.platform, summary("legacy"));
-        if (row.legacyFile) {
+        if (legacyFile) {
             legacy->cache();
         }
 
         auto migrated = QAXWarranty::migrateLegacyCachedWarrantyIfNeededForSerialNumber(
             local.platform, "C02SERIAL");
         EXPECT_FALSE(fs::exists(QAXWarranty::_legacyWarrantyPath(*local.platform)));
-        if (!row.legacyFile) {
+        if (!legacyFile) {
             EXPECT_FALSE(migrated);
             EXPECT_FALSE(local.log->contains("Migrating legacy warranty.."));
             for (int i = 0; i < 3; ++i) {
