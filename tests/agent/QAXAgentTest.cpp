@@ -58,16 +58,8 @@ class QAXAgentTest : public ::testing::Test {
 
 TEST_F(QAXAgentTest, PolicyDecisionTable) {
     enum State { Fresh, Expired, NoDate, Missing, OldVersion, OtherLocale, SignedOut, WeekOld };
-    struct Row {
-        State state;
-        std::uint64_t policy;
-        bool downloadGives;
-        bool downloads;
-        const char* reply;
-        const char* message;
-    };
     // clang-format off
-    const Row rows[] = {
+    const std::tuple<State, std::uint64_t, bool, bool, const char*, const char*> rows[] = {
         {Fresh, 0, true, false, "cached", "warranty valid for 1.00 seconds"},
         {Expired, 0, true, true, "new", "warranty validity expired 0.00 seconds ago, refresh it"},
         {Expired, 0, false, true, "cached", nullptr},
@@ -93,13 +85,12 @@ TEST_F(QAXAgentTest, PolicyDecisionTable) {
     };
     // clang-format on
     const Date now = env.clock->now();
-    for (const auto& row : rows) {
-        SCOPED_TRACE("state " + std::to_string(row.state) + ", policy " +
-                     std::to_string(row.policy));
+    for (const auto& [state, policy, downloadGives, downloaded, reply, message] : rows) {
+        SCOPED_TRACE("state " + std::to_string(state) + ", policy " + std::to_string(policy));
         provider = std::make_shared<test::FakeWarrantyProvider>();
         agent->setWarrantyProvider(provider);
         Cache cache{warranty("cached"), "2", "en_US", now.byAdding(-86399)};
-        switch (row.state) {
+        switch (state) {
             case Fresh:
                 break;
             case Expired:
@@ -125,30 +116,30 @@ TEST_F(QAXAgentTest, PolicyDecisionTable) {
                 break;
         }
         provider->setCache("S", cache);
-        provider->setDownloadResult("S", row.downloadGives ? warranty("new") : nullptr);
+        provider->setDownloadResult("S", downloadGives ? warranty("new") : nullptr);
         env.log->clear();
         // The evaluation alone acts on nothing; what it would answer without a download is
         // the reply whenever no new warranty comes.
         const auto evaluation = QAXAgent::evaluateWarrantyPolicy(
-            *env.platform, *provider, static_cast<QAXWarrantyPolicy>(row.policy), "S");
+            *env.platform, *provider, static_cast<QAXWarrantyPolicy>(policy), "S");
         EXPECT_TRUE(provider->calls().empty());
-        if (std::string(row.reply) != "new") {
+        if (std::string(reply) != "new") {
             EXPECT_EQ(evaluation.answerWithoutDownload() != nullptr,
-                      std::string(row.reply) == "cached");
+                      std::string(reply) == "cached");
         }
 
         int replies = 0;
         std::string got;
-        agent->getWarrantyUsingPolicy(static_cast<QAXWarrantyPolicy>(row.policy), "S",
+        agent->getWarrantyUsingPolicy(static_cast<QAXWarrantyPolicy>(policy), "S",
                                       [&](std::shared_ptr<QAXWarranty> w) {
                                           ++replies;
                                           got = tagOf(w);
                                       });
         EXPECT_EQ(replies, 1);
-        EXPECT_EQ(got, row.reply);
-        EXPECT_EQ(downloads().size(), row.downloads ? 1u : 0u);
-        if (row.message) {
-            EXPECT_EQ(env.log->count(row.message), 1);
+        EXPECT_EQ(got, reply);
+        EXPECT_EQ(downloads().size(), downloaded ? 1u : 0u);
+        if (message) {
+            EXPECT_EQ(env.log->count(message), 1);
         }
     }
 }

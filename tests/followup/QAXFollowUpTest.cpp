@@ -110,7 +110,8 @@ TEST_F(QAXFollowUpTest, PostedItemIdentifiesAndTargetsTheDevice) {
         EXPECT_EQ(item->actions[0].identifier, "com.followup.qax_followup_open_action");
         EXPECT_FALSE(item->actions[0].url);
         EXPECT_TRUE(logged("Posted follow-up: serialNumber:" + serial + " -> success"));
-        EXPECT_EQ(analytics->events().back().payload, Value::Dictionary{{"devicetype", typeText}});
+        EXPECT_EQ(analytics->events().back().payload,
+                  (Value::Dictionary{{"devicetype", typeText}}));
     }
     EXPECT_EQ(analytics->events().size(), 3u);
 

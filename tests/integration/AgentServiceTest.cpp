@@ -156,9 +156,9 @@ TEST_F(AgentServiceTest, EntitledClientsAreServedOthersClosedAndBrokenSendersAlo
     };
     for (const auto& [op, args, text] : errors) {
         std::string transport;
-        auto reply = client->call(op, args, kWait, &transport);
-        ASSERT_TRUE(reply && reply->error) << op << ": " << transport;
-        EXPECT_EQ(reply->error->rfind(text, 0), 0u) << *reply->error;
+        auto answer = client->call(op, args, kWait, &transport);
+        ASSERT_TRUE(answer && answer->error) << op << ": " << transport;
+        EXPECT_EQ(answer->error->rfind(text, 0), 0u) << *answer->error;
     }
 
     // Far more requests at once than the agent keeps in flight, one of them in XML: each is

@@ -161,7 +161,7 @@ TEST_F(CoverageSimScenarioTest, StoreEndpointsServeTheHostBindings) {
     EXPECT_FALSE(unknown.second);
     EXPECT_TRUE(unknown.first.empty());
     EXPECT_EQ(*sim.requestLog().back().find("query"),
-              Value::Dictionary{{"bundleId", Value("a&b=c d")}});
+              (Value::Dictionary{{"bundleId", Value("a&b=c d")}}));
 
     auto [bought, boughtError] = purchases(42, {"com.velmora.support"});
     ASSERT_FALSE(boughtError) << *boughtError;

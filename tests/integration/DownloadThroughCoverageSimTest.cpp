@@ -132,7 +132,7 @@ TEST(DownloadThroughCoverageSim, PreviewedRequestsThenForcedDownloadThenCachedAn
     ASSERT_EQ(downloaded.size(), 2u);
     ASSERT_TRUE(downloaded.at(kPhone) && downloaded.at(kWatch)) << agent.log();
     EXPECT_EQ(preferences.objectForKey("ServerVersionCache"),
-              Value::Dictionary{{"LowServerVersion", 2}, {"HighServerVersion", 3}});
+              (Value::Dictionary{{"LowServerVersion", 2}, {"HighServerVersion", 3}}));
     std::map<std::string, std::string> attestation;
     int renewals = 0;
     const auto log = sim->requestLog();

@@ -281,20 +281,15 @@ TEST_F(QaxctlExplainTest, PredictsWhatTheAgentsRefreshDoes) {
 }
 
 TEST_F(QaxctlExplainTest, DismissalConversionAndActivationAgreeWithThePostRule) {
-    struct Row {
-        const char* name;
-        double dismissedDaysAgo;  // < 0: not dismissed
-        double activatedInDays;
-        const char* postRule;
-        bool reopens, moved;
-    } rows[] = {
+    // A dismissal (days ago; < 0: none), the activation, and what explain and the rule say.
+    const std::tuple<const char*, double, double, const char*, bool, bool> rows[] = {
         {"dismissed before the offer opened", 8, -60, "due", true, false},
         {"dismissed after it opened", 2, -60, "dismissed", false, false},
         {"activated after it opened", -1, 2, "futurePostDate", false, true},
     };
     cacheSummary(summary(5, 20));
-    for (const auto& row : rows) {
-        SCOPED_TRACE(row.name);
+    for (const auto& [name, dismissedDaysAgo, activatedInDays, postRule, reopens, moved] : rows) {
+        SCOPED_TRACE(name);
         auto& prefs = *platform->preferences;
         const std::string hash = sha256Hash(kPhone);
         for (const char* key :
@@ -303,20 +298,19 @@ TEST_F(QaxctlExplainTest, DismissalConversionAndActivationAgreeWithThePostRule) 
             prefs.removeObject(key);
         }
         prefs.removeObject(hash + ".dismissed");
-        if (row.dismissedDaysAgo >= 0) {
+        if (dismissedDaysAgo >= 0) {
             prefs.setObject("FollowupDismissedSerialNumberHashes", Value::Array{Value(hash)});
-            prefs.setObject(hash + ".dismissed", Value(Date(start - row.dismissedDaysAgo * kDay)));
+            prefs.setObject(hash + ".dismissed", Value(Date(start - dismissedDaysAgo * kDay)));
         }
-        prefs.setObject("DefaultDeviceActivationDate",
-                        Value(Date(start + row.activatedInDays * kDay)));
+        prefs.setObject("DefaultDeviceActivationDate", Value(Date(start + activatedInDays * kDay)));
         const Value x = explain({kPhone});
-        expectAt(x, {{"offer.postRule", row.postRule},
-                     {"offer.conversionReopens", row.reopens},
-                     {"offer.postDateMovedByActivation", row.moved},
-                     {"post.postsThisDevice", std::string(row.postRule) == "due"}});
+        expectAt(x, {{"offer.postRule", postRule},
+                     {"offer.conversionReopens", reopens},
+                     {"offer.postDateMovedByActivation", moved},
+                     {"post.postsThisDevice", std::string(postRule) == "due"}});
         // The agent's post rule, for real on these files, does what explain said.
         EXPECT_EQ(QAXFollowUp(platform).postFollowUpWithDevicesInfo({phoneInfo()}),
-                  std::string(row.postRule) == "due");
+                  std::string(postRule) == "due");
     }
 }
 

@@ -118,10 +118,10 @@ TEST_F(QaxctlHostState, FollowUpsAsTheSettingsApplicationWouldShowThem) {
         const Value& a = (*list.asArray())[0];
         EXPECT_EQ(*a.find("badge"), Value(true));
         EXPECT_EQ(*a.find("target"), Value("com.velmora.Preferences"));
-        EXPECT_EQ(*a.find("notification"), Value::Dictionary{{"title", "Offer"},
-                                                             {"text", "Ends soon"},
-                                                             {"activateLabel", "Details"},
-                                                             {"clearLabel", "Clear"}});
+        EXPECT_EQ(*a.find("notification"), (Value::Dictionary{{"title", "Offer"},
+                                                              {"text", "Ends soon"},
+                                                              {"activateLabel", "Details"},
+                                                              {"clearLabel", "Clear"}}));
         EXPECT_EQ(*(*list.asArray())[1].find("badge"), Value(false));
     }
 }

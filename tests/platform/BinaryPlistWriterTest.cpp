@@ -120,7 +120,7 @@ TEST(BinaryPlistWriterTest, FramesCarryTheirLengthAndInvalidTextReadsAsReplaceme
     ASSERT_EQ(decoder.next(payload), IpcFrameCodec::Status::Frame);
     EXPECT_FALSE(decoder.hasPartialFrame());
     EXPECT_EQ(parsePlist(payload),
-              Value::Dictionary{{"id", Value(1)}, {"error", "bad \xef\xbf\xbd byte"}});
+              (Value::Dictionary{{"id", Value(1)}, {"error", "bad \xef\xbf\xbd byte"}}));
 }
 
 }  // namespace

@@ -160,7 +160,7 @@ TEST_F(FilePreferenceStoreTest, CorruptDomainIsReportedReadAsEmptyAndKeptUntilTh
         ASSERT_TRUE(store.setObject("SerialNumber", Value("C02NEW")));
         auto onDisk = parsePlist(readFile(path));
         ASSERT_TRUE(onDisk);
-        EXPECT_EQ(*onDisk, Value::Dictionary{{"SerialNumber", Value("C02NEW")}});
+        EXPECT_EQ(*onDisk, (Value::Dictionary{{"SerialNumber", Value("C02NEW")}}));
     }
 }
 

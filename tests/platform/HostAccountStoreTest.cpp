@@ -177,7 +177,7 @@ TEST_F(HostAccountStoreTest, SigningRenewsThroughTheTokenService) {
     EXPECT_EQ(storedToken(), "server-token-1");
     ASSERT_EQ(server.requests().size(), 1u);
     EXPECT_EQ(parseJson(server.requests()[0].body),
-              Value::Dictionary{{"altDSID", "kf-alt"}, {"services", Value::Array{kService}}});
+              (Value::Dictionary{{"altDSID", "kf-alt"}, {"services", Value::Array{kService}}}));
     // A stored token needs no renewal unless forced.
     HttpRequest second("https://coverage.example/");
     ASSERT_TRUE(qax_signWithAccountHeaders(second, *tp.platform, false, true, "com.example.app"));

@@ -59,7 +59,7 @@ TEST(HostFollowUpCenter, CodecKeepsEveryFieldAndWritesOptionsByName) {
     const auto decoded = FollowUpItemCodec::decode(*stored.asDictionary());
     EXPECT_EQ(FollowUpItemCodec::encode(decoded.item, decoded.postedDate), stored);
     EXPECT_EQ(*stored.find("notification")->find("options"),
-              Value::Array{"LockScreen", "ExtensionForNotification"});
+              (Value::Array{"LockScreen", "ExtensionForNotification"}));
     EXPECT_FALSE(stored.find("targetBundleIdentifier")) << "a missing text is a missing key";
     EXPECT_FALSE(stored.find("informativeFooterText"));
     // Milliseconds of the expiration date survive the binary store.

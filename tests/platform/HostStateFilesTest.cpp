@@ -176,9 +176,9 @@ TEST(HostAnalyticsSink, AppendsEventsUnlessTurnedOff) {
     };
     sink.sendEventLazily("com.velmora.kestova.followupDisplayCount", payload);
     EXPECT_EQ(parseJson(readFile(HostAnalyticsSink::eventsPath(root.str()))),
-              Value::Dictionary{{"time", "2023-11-14T22:13:20.000Z"},
-                                {"event", "com.velmora.kestova.followupDisplayCount"},
-                                {"payload", Value::Dictionary{{"devicetype", "Watch"}}}});
+              (Value::Dictionary{{"time", "2023-11-14T22:13:20.000Z"},
+                                 {"event", "com.velmora.kestova.followupDisplayCount"},
+                                 {"payload", Value::Dictionary{{"devicetype", "Watch"}}}}));
     writeFile(root.path() / "analytics.plist", xmlPlist("<dict><key>Enabled</key><false/></dict>"));
     sink.sendEventLazily("e", payload);
     EXPECT_EQ(built, 1) << "the payload is never built while the sink is off";
@@ -231,10 +231,10 @@ TEST(HostUserInterfaceStrings, LanguageFallbacks) {
         {"fr_FR", "DETAILS", "Other", "default"},
         {"fr_FR", "DETAILS", "../fr.lproj/Localizable", "default"},
     };
-    for (const auto& [language, key, table, expected] : rows) {
+    for (const auto& [language, key, tableName, expected] : rows) {
         locale->identifier = language;
-        EXPECT_EQ(strings.localizedString(key, "default", table), expected)
-            << language << " " << key << " " << table;
+        EXPECT_EQ(strings.localizedString(key, "default", tableName), expected)
+            << language << " " << key << " " << tableName;
     }
 }
 

@@ -110,44 +110,40 @@ TEST_F(QAXSchedulerTest, ScheduleForDateSetsOrRemovesTheTarget) {
 }
 
 TEST_F(QAXSchedulerTest, FiringDecidesByTheStoredTarget) {
-    struct Row {
-        const char* name;
-        std::optional<double> targetFromNow;
-        std::optional<std::int64_t> delegateResult;  // none: the run is deferred unrun
-        ActivityResult handedBack;
-        bool targetKept;
-    };
-    const Row rows[] = {
-        {"ten minutes early", 600, std::nullopt, ActivityResult::Deferred, true},
-        {"exactly at target, finished", 0, QAXActivityResultFinished, ActivityResult::Finished,
-         false},
-        {"late, finished", -5, QAXActivityResultFinished, ActivityResult::Finished, false},
-        {"late, deferred by the run", -5, QAXActivityResultDeferred, ActivityResult::Deferred,
-         true},
-        {"no target", std::nullopt, QAXActivityResultFinished, ActivityResult::Finished, false},
-    };
-    for (const Row& row : rows) {
-        SCOPED_TRACE(row.name);
+    // The target, what the run reports (none: the run is deferred unrun), what the platform hears.
+    const std::tuple<const char*, std::optional<double>, std::optional<std::int64_t>,
+                     ActivityResult, bool>
+        rows[] = {
+            {"ten minutes early", 600, std::nullopt, ActivityResult::Deferred, true},
+            {"exactly at target, finished", 0, QAXActivityResultFinished, ActivityResult::Finished,
+             false},
+            {"late, finished", -5, QAXActivityResultFinished, ActivityResult::Finished, false},
+            {"late, deferred by the run", -5, QAXActivityResultDeferred, ActivityResult::Deferred,
+             true},
+            {"no target", std::nullopt, QAXActivityResultFinished, ActivityResult::Finished, false},
+        };
+    for (const auto& [name, targetFromNow, delegateResult, handedBack, targetKept] : rows) {
+        SCOPED_TRACE(name);
         auto run = std::make_shared<RecordingActivity>();
         auto scheduler = make(run);
-        if (row.targetFromNow) {
-            scheduler->scheduleActivityWithDelay(*row.targetFromNow);
+        if (targetFromNow) {
+            scheduler->scheduleActivityWithDelay(*targetFromNow);
         } else {
             scheduler->scheduleActivityForDate(std::nullopt);
         }
         const auto before = activity()->results().size();
         ASSERT_TRUE(activity()->fire());
-        if (row.delegateResult) {
+        if (delegateResult) {
             EXPECT_EQ(run->runs, 1);
             ASSERT_TRUE(run->pending);
-            run->pending(*row.delegateResult);
+            run->pending(*delegateResult);
         } else {
             EXPECT_EQ(run->runs, 0);
             EXPECT_TRUE(tp.log->contains(
                 "target not past for 'com.velmora.qaxagent.outreach', defer for: 600.00"));
         }
-        EXPECT_EQ(hasTarget(), row.targetKept);
-        if (!row.targetKept) {
+        EXPECT_EQ(hasTarget(), targetKept);
+        if (!targetKept) {
             EXPECT_FALSE(scheduler->scheduledActivityDate());
         }
 
@@ -156,7 +152,7 @@ TEST_F(QAXSchedulerTest, FiringDecidesByTheStoredTarget) {
         EXPECT_EQ(activity()->results().size(), before);
         tp.runner->advanceBy(0.001);
         ASSERT_EQ(activity()->results().size(), before + 1);
-        EXPECT_EQ(activity()->results().back(), row.handedBack);
+        EXPECT_EQ(activity()->results().back(), handedBack);
     }
 }
 

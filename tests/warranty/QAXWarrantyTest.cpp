@@ -394,9 +394,9 @@ TEST_F(QAXWarrantyTest, ArchivesRoundTripAndRefuseWhatMayNotCrossIPC) {
         {"a null deep inside", archive(Value("QAXWarranty"), withNull)},
         {"not a dictionary", Value("QAXWarranty")},
     };
-    for (const auto& [name, archive] : refused) {
+    for (const auto& [name, bad] : refused) {
         SCOPED_TRACE(name);
-        EXPECT_FALSE(QAXWarranty::decode(tp.platform, archive));
+        EXPECT_FALSE(QAXWarranty::decode(tp.platform, bad));
     }
 }
 
