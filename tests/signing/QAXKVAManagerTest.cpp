@@ -218,22 +218,14 @@ TEST_F(QAXKVAManagerTest, HeadersCarryAVerifiableSignatureAndChain) {
 }
 
 TEST_F(QAXKVAManagerTest, IssuanceOutcomes) {
-    struct Row {
-        const char* name;
-        std::vector<Step> script;
-        bool generated;
-        std::size_t issuances;
-        bool completionHasChain;
-        std::optional<long> completionError;
-        std::vector<std::string> messages;  // each must be logged
-    };
     const std::string fallback =
         "-[QAXKVAManager generateKVACertficate:]_completion: KVA (UVXT) failed due to missing "
         "UVXT with error: AttestationError(code -11): scripted failure, falling back to KVA (SVXT)";
     const std::string noChain =
         "-[QAXKVAManager generateKVACertficate:]_completion: Failed to get reference key or cert!";
     // clang-format off
-    const Row rows[] = {
+    // The script, whether a key came, the issuances, what the completion got, messages logged.
+    const std::tuple<const char*, std::vector<Step>, bool, std::size_t, bool, std::optional<long>, std::vector<std::string>> rows[] = {
         {"missing user certificate (-11) falls back", {{Step::Fail, -11}, {Step::Forward}}, true,
          2, true, std::nullopt, {fallback}},
         {"missing user certificate (-4) falls back", {{Step::Fail, -4}, {Step::Forward}}, true, 2,
@@ -246,10 +238,11 @@ TEST_F(QAXKVAManagerTest, IssuanceOutcomes) {
         {"no chain", {{Step::KeyOnly}}, false, 1, false, std::nullopt, {noChain}},
     };
     // clang-format on
-    for (const auto& row : rows) {
-        SCOPED_TRACE(row.name);
+    for (const auto& [name, script, generates, issuances, completionHasChain, completionError,
+                      messages] : rows) {
+        SCOPED_TRACE(name);
         tp.log->clear();
-        scripted->script.assign(row.script.begin(), row.script.end());
+        scripted->script.assign(script.begin(), script.end());
         std::size_t before = scripted->calls().size();
         std::atomic<int> completions{0};
         bool hadChain = false;
@@ -263,17 +256,17 @@ TEST_F(QAXKVAManagerTest, IssuanceOutcomes) {
             error = e ? std::optional<long>(e->code) : std::nullopt;
         });
         scripted->drain();
-        EXPECT_EQ(generated, row.generated);
+        EXPECT_EQ(generated, generates);
         EXPECT_EQ(completions.load(), 1) << "one completion, one signal";
-        EXPECT_EQ(hadChain, row.completionHasChain);
-        EXPECT_EQ(error, row.completionError);
+        EXPECT_EQ(hadChain, completionHasChain);
+        EXPECT_EQ(error, completionError);
         auto calls = scripted->calls();
-        ASSERT_EQ(calls.size() - before, row.issuances);
+        ASSERT_EQ(calls.size() - before, issuances);
         EXPECT_FALSE(calls[before].svxtAttestation);
-        if (row.issuances == 2) {
+        if (issuances == 2) {
             EXPECT_TRUE(calls[before + 1].svxtAttestation);
         }
-        for (const auto& m : row.messages) {
+        for (const auto& m : messages) {
             EXPECT_TRUE(tp.log->contains(m)) << m;
         }
         EXPECT_EQ(generated, manager->privateKey() != nullptr);

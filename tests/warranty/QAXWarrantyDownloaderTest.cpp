@@ -298,16 +298,10 @@ TEST_F(QAXWarrantyDownloaderTest, ConversionOutreachMovesOnlyEarlier) {
         return QAXWarranty::warrantyWithDictionary(tp.platform, d);
     };
     const double D = 1'800'000'000;
-    struct Row {
-        const char* name;
-        std::optional<std::optional<double>> previous;  // outer none: nothing cached
-        std::optional<double> next;
-        std::optional<double> scheduled;
-        bool schedules;
-        const char* message;
-    };
     // clang-format off
-    const Row rows[] = {
+    // The cached conversion date (outer none: nothing cached), the new one, the date scheduled
+    // before, whether the run schedules, and its message.
+    const std::tuple<const char*, std::optional<std::optional<double>>, std::optional<double>, std::optional<double>, bool, const char*> rows[] = {
         {"first date", std::nullopt, D, std::nullopt, true, "scheduling conversion outreach"},
         {"unchanged", std::optional<double>(D), D, std::nullopt, false, nullptr},
         {"previous had none", std::optional<double>(), D, std::nullopt, false, nullptr},
@@ -318,10 +312,10 @@ TEST_F(QAXWarrantyDownloaderTest, ConversionOutreachMovesOnlyEarlier) {
          "Re-scheduling conversion outreach"},
     };
     // clang-format on
-    for (const auto& row : rows) {
-        SCOPED_TRACE(row.name);
-        if (row.scheduled) {
-            prefs().setObject(kScheduledKey, Value(Date(*row.scheduled)));
+    for (const auto& [name, previous, next, scheduled, schedules, message] : rows) {
+        SCOPED_TRACE(name);
+        if (scheduled) {
+            prefs().setObject(kScheduledKey, Value(Date(*scheduled)));
         } else {
             prefs().removeObject(kScheduledKey);
         }
@@ -330,18 +324,18 @@ TEST_F(QAXWarrantyDownloaderTest, ConversionOutreachMovesOnlyEarlier) {
         auto downloader =
             QAXWarrantyDownloader::initWithCallingProcessBundleID(tp.platform, kCaller);
         downloader->_scheduleConversionOutreachIfRequiredForWarranty(
-            record(row.next), row.previous ? record(*row.previous) : nullptr);
+            record(next), previous ? record(*previous) : nullptr);
 
         auto schedulings = factory().schedulings();
-        ASSERT_EQ(schedulings.size() - before, row.schedules ? 1u : 0u);
-        if (row.schedules) {
+        ASSERT_EQ(schedulings.size() - before, schedules ? 1u : 0u);
+        if (schedules) {
             EXPECT_EQ(schedulings.back().identifier, kQAXConversionOutreachActivityIdentifier);
             EXPECT_EQ(schedulings.back().date, Date(D));
             EXPECT_EQ(prefs().dateForKey(kScheduledKey), Date(D));
-            EXPECT_EQ(tp.log->count(std::string(row.message) + " " + Date(D).description()), 1);
+            EXPECT_EQ(tp.log->count(std::string(message) + " " + Date(D).description()), 1);
         } else {
             EXPECT_EQ(prefs().dateForKey(kScheduledKey),
-                      row.scheduled ? std::optional<Date>(Date(*row.scheduled)) : std::nullopt);
+                      scheduled ? std::optional<Date>(Date(*scheduled)) : std::nullopt);
         }
     }
 }
