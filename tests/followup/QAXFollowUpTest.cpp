@@ -221,16 +221,10 @@ TEST_F(QAXFollowUpTest, PostRuleDecidesEachDevice) {
     auto displayTomorrow = offer(30);
     displayTomorrow["hvOfferFollowupDisplayDate"] = Value(epoch(1));
 
-    struct Row {
-        const char* serial;
-        std::optional<Value::Dictionary> summary;
-        std::optional<Date> activation;
-        bool due;
-        std::string message;
-    };
     const std::string notPosted = "Device eligible with future post date. Cannot post followup";
     // clang-format off
-    const std::vector<Row> rows = {
+    const std::tuple<const char*, std::optional<Value::Dictionary>, std::optional<Date>, bool,
+                     std::string> rows[] = {
         {"A", std::nullopt, {}, false, "No warranty downloaded for device. Don't post a followup"},
         {"B", noDisplay, {}, false, "Device NOT eligible. Don't post a followup"},
         {"C", noEnd, {}, false, "Device no longer eligible. Don't post a followup"},
@@ -241,17 +235,16 @@ TEST_F(QAXFollowUpTest, PostRuleDecidesEachDevice) {
         {"H", displayTomorrow, {}, false, notPosted},
     };
     // clang-format on
-    for (const Row& row : rows) {
-        SCOPED_TRACE(row.serial);
-        auto deviceInfo = info(row.serial, row.summary, QAXDeviceTypeDefault, row.activation);
-        EXPECT_EQ(followUp.postFollowUpWithDevicesInfo({deviceInfo}), row.due);
-        EXPECT_EQ(pending(row.serial).has_value(), row.due);
-        EXPECT_TRUE(
-            logged(std::string(kPostRule) + ": " + row.message + " for " +
-                   deviceInfo->device()->description() +
-                   (row.due || row.message.find("future") == std::string::npos
-                        ? ""
-                        : " on: " + (row.activation ? *row.activation : at(1)).description())));
+    for (const auto& [serial, summary, activation, due, message] : rows) {
+        SCOPED_TRACE(serial);
+        auto deviceInfo = info(serial, summary, QAXDeviceTypeDefault, activation);
+        EXPECT_EQ(followUp.postFollowUpWithDevicesInfo({deviceInfo}), due);
+        EXPECT_EQ(pending(serial).has_value(), due);
+        EXPECT_TRUE(logged(std::string(kPostRule) + ": " + message + " for " +
+                           deviceInfo->device()->description() +
+                           (due || message.find("future") == std::string::npos
+                                ? ""
+                                : " on: " + (activation ? *activation : at(1)).description())));
     }
     EXPECT_EQ(tp.log->count(std::string(kPostRule) +
                             ": Using initial postdate as it is later than FollowupDisplay Date"),
@@ -384,19 +377,13 @@ TEST_F(QAXFollowUpTest, NotificationDismissalStripsEveryMatchingItem) {
 }
 
 TEST_F(QAXFollowUpTest, LegacyItemIsMigratedOrCleared) {
-    struct Row {
-        const char* name;
-        std::vector<std::string> pendingIds;  // "" stands for the legacy identifier
-        bool warranty;
-        const char* postError;
-        const char* clearError;
-        std::vector<std::string> after;
-        std::string message;
-    };
     const std::string device = QAXFollowUp::uniqueIdentfierForSerialNumber("SN");
     const std::string other = QAXFollowUp::uniqueIdentfierForSerialNumber("OTHER");
     // clang-format off
-    const std::vector<Row> rows = {
+    // The pending identifiers ("" stands for the legacy one), a warranty, failures of the post
+    // and the clear, the identifiers after, and the message logged.
+    const std::tuple<const char*, std::vector<std::string>, bool, const char*, const char*,
+                     std::vector<std::string>, std::string> rows[] = {
         {"migrated", {""}, true, nullptr, nullptr, {device}, "Migrating legacy followup.."},
         {"no warranty", {""}, false, nullptr, nullptr, {},
          "Clearing legacy followup, no legacy warranty was found.."},
@@ -407,26 +394,26 @@ TEST_F(QAXFollowUpTest, LegacyItemIsMigratedOrCleared) {
         {"not legacy", {other}, true, nullptr, nullptr, {other}, ""},
     };
     // clang-format on
-    for (const Row& row : rows) {
-        SCOPED_TRACE(row.name);
+    for (const auto& [name, pendingIds, warranty, postError, clearError, left, message] : rows) {
+        SCOPED_TRACE(name);
         tp.log->clear();
         std::vector<FollowUpItem> seeded;
-        for (const auto& id : row.pendingIds) {
+        for (const auto& id : pendingIds) {
             seeded.push_back(pendingItemFor("SN", id.empty() ? std::string(kClient) : id));
         }
         center->setItems(kClient, seeded);
         auto error = [](const char* e) { return e ? std::optional<std::string>(e) : std::nullopt; };
-        center->failPost(error(row.postError));
-        center->failClear(error(row.clearError));
+        center->failPost(error(postError));
+        center->failClear(error(clearError));
         followUp.migrateLegacyFollowUpIfNeededWithDeviceInfo(
-            info("SN", row.warranty ? std::optional(offer(30)) : std::nullopt));
+            info("SN", warranty ? std::optional(offer(30)) : std::nullopt));
         std::vector<std::string> after;
         for (const auto& item : center->items(kClient)) {
             after.push_back(*item.uniqueIdentifier);
         }
-        EXPECT_EQ(after, row.after);
-        if (!row.message.empty()) {
-            EXPECT_TRUE(logged(row.message));
+        EXPECT_EQ(after, left);
+        if (!message.empty()) {
+            EXPECT_TRUE(logged(message));
         } else {
             EXPECT_TRUE(tp.log->messages().empty());
         }
