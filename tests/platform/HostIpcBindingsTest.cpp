@@ -187,22 +187,21 @@ TEST(HostUnixSocketPathTest, ClaimsFreeAndStalePathsButNotLiveOnes) {
 TEST(HostNotificationSocketTest, DeliversNamesToEverySubscriber) {
     test::TempDir dir;
     HostNotificationSocket socket(dir.str());
-    std::promise<std::optional<std::string>> first, second;
-    auto id1 =
-        socket.subscribe([&first](const std::optional<std::string>& n) { first.set_value(n); });
-    auto id2 =
-        socket.subscribe([&second](const std::optional<std::string>& n) { second.set_value(n); });
-    ASSERT_NE(id1, 0u);
-    ASSERT_NE(id2, 0u);
+    std::promise<std::optional<std::string>> heard[2];
+    std::vector<std::uint64_t> ids;
+    for (auto& promise : heard) {
+        ids.push_back(socket.subscribe([&promise](const auto& n) { promise.set_value(n); }));
+        ASSERT_NE(ids.back(), 0u);
+    }
     ASSERT_TRUE(HostNotificationSocket::post(dir.str(), "com.velmora.language.changed"));
-    auto f1 = first.get_future();
-    auto f2 = second.get_future();
-    ASSERT_EQ(f1.wait_for(std::chrono::seconds(5)), std::future_status::ready);
-    ASSERT_EQ(f2.wait_for(std::chrono::seconds(5)), std::future_status::ready);
-    EXPECT_EQ(f1.get(), "com.velmora.language.changed");
-    EXPECT_EQ(f2.get(), "com.velmora.language.changed");
-    socket.unsubscribe(id1);
-    socket.unsubscribe(id2);
+    for (auto& promise : heard) {
+        auto name = promise.get_future();
+        ASSERT_EQ(name.wait_for(std::chrono::seconds(5)), std::future_status::ready);
+        EXPECT_EQ(name.get(), "com.velmora.language.changed");
+    }
+    for (auto id : ids) {
+        socket.unsubscribe(id);
+    }
 }
 
 }  // namespace
