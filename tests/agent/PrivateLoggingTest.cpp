@@ -17,11 +17,7 @@ namespace {
 TEST(PrivateText, MarkedSpansAreRedactedOrUnmarked) {
     const std::string watch = "Watch (" + privateText("W7SERIAL") + ")";
     const std::string nested = privateText("a " + privateText("b") + " c");
-    struct Row {
-        std::string message;
-        const char* redacted;
-        const char* shown;
-    } rows[] = {
+    const std::tuple<std::string, const char*, const char*> rows[] = {
         {"no marks", "no marks", "no marks"},
         {watch, "Watch (<private>)", "Watch (W7SERIAL)"},
         {watch + " and " + privateText("C02"), "Watch (<private>) and <private>",
@@ -29,9 +25,9 @@ TEST(PrivateText, MarkedSpansAreRedactedOrUnmarked) {
         {nested, "<private>", "a b c"},
         {privateText(""), "<private>", ""},
     };
-    for (const auto& r : rows) {
-        EXPECT_EQ(resolvePrivateText(r.message, false), r.redacted);
-        EXPECT_EQ(resolvePrivateText(r.message, true), r.shown);
+    for (const auto& [message, redacted, shown] : rows) {
+        EXPECT_EQ(resolvePrivateText(message, false), redacted);
+        EXPECT_EQ(resolvePrivateText(message, true), shown);
     }
 }
 
@@ -51,9 +47,9 @@ TEST(PrivateLogging, NoSerialNumberInTheLogOfTheAgentsRequests) {
     auto& prefs = *env.platform->preferences;
     qax_registerDefaults(prefs);
     prefs.setObject("ServerVersionOverride",
-                    Value(Value::Dictionary{{"LowServerVersion", 2}, {"HighServerVersion", 3}}));
+                    Value::Dictionary{{"LowServerVersion", 2}, {"HighServerVersion", 3}});
     prefs.setObject("PairedWatchesSerialNumbers",
-                    Value(Value::Dictionary{{"W7PRIVATE01", "W7SUBSTITUTE"}}));
+                    Value::Dictionary{{"W7PRIVATE01", "W7SUBSTITUTE"}});
 
     auto provider = std::make_shared<test::FakeWarrantyProvider>();
     auto agent = QAXAgent::initWithWarrantyProvider(

@@ -73,16 +73,13 @@ TEST_F(QAXAgentRemoteInterfaceTest, EveryOperationWithGoodAndHostileArguments) {
     const std::string wrong = "error";
     const std::string yes = Value(true).description();
     const std::string no = Value(false).description();
-    struct Case {
-        const char* op;
-        Value::Array args;
-        std::string shape;  // "error", "none", a class name, "[...]" or a printed value
-    };
     const char* kInfo = kInfoOp;
     const char* kAll = "getAllDeviceInfosUsingPolicy:updateFollowUps:withReply:";
     const char* kDefaultInfo = "getDefaultDeviceInfoUsingPolicy:withReply:";
     // clang-format off
-    const Case cases[] = {
+    // Operation, arguments, and the reply's shape: "error", "none", a class name, "[...]" or a
+    // printed value.
+    const std::tuple<const char*, Value::Array, std::string> cases[] = {
         {"scheduleOutreachWithReply:", {}, yes},
         {"scheduleOutreachAfter:withReply:", {Value(3.5)}, yes},
         {"scheduleOutreachAfter:withReply:", {Value(-30)}, yes},
@@ -96,7 +93,7 @@ TEST_F(QAXAgentRemoteInterfaceTest, EveryOperationWithGoodAndHostileArguments) {
         {"checkIsAvailableInStore:withReply:", {Value(huge)}, wrong},
         {"appSupportAvailability:withReply:", {Value("com.velmora.support")},
          Value(Value::Dictionary{{"AppBundleID", "com.velmora.support"}}).description()},
-        {"appSupportAvailability:withReply:", {Value(Value::Array{})}, wrong},
+        {"appSupportAvailability:withReply:", {Value::Array{}}, wrong},
         {"readWebURLOverride:", {}, "none"},
         {"defaultDevice:", {}, "QAXDevice"},
         {"defaultDevice:", {Value(1)}, wrong},
@@ -125,11 +122,11 @@ TEST_F(QAXAgentRemoteInterfaceTest, EveryOperationWithGoodAndHostileArguments) {
         {"defaultDevice", {}, wrong},
     };
     // clang-format on
-    for (const auto& c : cases) {
-        SCOPED_TRACE(std::string(c.op) + " " + Value(c.args).description().substr(0, 80));
-        auto out = invoke(c.op, c.args);
+    for (const auto& [op, args, shape] : cases) {
+        SCOPED_TRACE(std::string(op) + " " + Value(args).description().substr(0, 80));
+        auto out = invoke(op, args);
         EXPECT_EQ(out.calls, 1);
-        EXPECT_EQ(shapeOf(out.reply), c.shape) << out.reply.error.value_or("");
+        EXPECT_EQ(shapeOf(out.reply), shape) << out.reply.error.value_or("");
     }
     // What reached the agent's collaborators, in order.
     EXPECT_EQ(provider->calls(),
@@ -143,19 +140,18 @@ TEST_F(QAXAgentRemoteInterfaceTest, EveryOperationWithGoodAndHostileArguments) {
     EXPECT_EQ(schedulings[2].date, env.clock->now().byAdding(-30));
 }
 
-TEST_F(QAXAgentRemoteInterfaceTest, ErrorsNameTheExpectedArguments) {
-    auto out = invoke(kInfoOp, {Value("")});
-    EXPECT_EQ(out.reply.error,
+TEST_F(QAXAgentRemoteInterfaceTest, ErrorsNameTheExpectedArgumentsAndNoDevicesIsAnEmptyList) {
+    EXPECT_EQ(invoke(kInfoOp, {Value("")}).reply.error,
               "wrong arguments: 'getDeviceInfoForSerialNumber:usingPolicy:withReply:' takes 2 "
               "arguments (serial number of 1 to 256 characters, unsigned integer)");
     EXPECT_EQ(invoke("noSuchOperation:", {}).reply.error, "unknown operation 'noSuchOperation:'");
-}
+    struct NotAnAgent : ExportedObject {};
+    auto notAnAgent = invoke("defaultDevice:", {}, std::make_shared<NotAnAgent>());
+    EXPECT_EQ(notAnAgent.calls, 1);
+    EXPECT_TRUE(notAnAgent.reply.error);
 
-TEST_F(QAXAgentRemoteInterfaceTest, NoPairedDevicesIsAnEmptyList) {
     devices->watches.clear();
-    auto none = invoke("pairedDevices:", {});
-    ASSERT_TRUE(none.reply.value);
-    EXPECT_EQ(*none.reply.value, Value(Value::Array{}));
+    EXPECT_EQ(invoke("pairedDevices:", {}).reply.value, Value::Array{});
 }
 
 TEST_F(QAXAgentRemoteInterfaceTest, WebURLOverrideOnlyOnInternalBuilds) {
@@ -168,13 +164,6 @@ TEST_F(QAXAgentRemoteInterfaceTest, WebURLOverrideOnlyOnInternalBuilds) {
     auto internal = invoke("readWebURLOverride:", {});
     EXPECT_EQ(internal.reply.value, Value("https://example.test/flow"));
     EXPECT_TRUE(env.log->contains("readWebURLOverride = https://example.test/flow"));
-}
-
-TEST_F(QAXAgentRemoteInterfaceTest, ObjectThatIsNotAnAgentGetsAnError) {
-    struct NotAnAgent : ExportedObject {};
-    auto out = invoke("defaultDevice:", {}, std::make_shared<NotAnAgent>());
-    EXPECT_EQ(out.calls, 1);
-    EXPECT_TRUE(out.reply.error);
 }
 
 }  // namespace

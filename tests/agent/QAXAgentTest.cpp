@@ -25,8 +25,7 @@ class QAXAgentTest : public ::testing::Test {
     QAXAgentTest() { qax_registerDefaults(*env.platform->preferences); }
 
     std::shared_ptr<QAXWarranty> warranty(const char* tag) {
-        return QAXWarranty::warrantyWithDictionary(env.platform,
-                                                   Value(Value::Dictionary{{"tag", tag}}));
+        return QAXWarranty::warrantyWithDictionary(env.platform, Value::Dictionary{{"tag", tag}});
     }
     static std::string tagOf(const std::shared_ptr<QAXWarranty>& w) {
         if (!w) {
@@ -59,16 +58,8 @@ class QAXAgentTest : public ::testing::Test {
 
 TEST_F(QAXAgentTest, PolicyDecisionTable) {
     enum State { Fresh, Expired, NoDate, Missing, OldVersion, OtherLocale, SignedOut, WeekOld };
-    struct Row {
-        State state;
-        std::uint64_t policy;
-        bool downloadGives;
-        bool downloads;
-        const char* reply;
-        const char* message;
-    };
     // clang-format off
-    const Row rows[] = {
+    const std::tuple<State, std::uint64_t, bool, bool, const char*, const char*> rows[] = {
         {Fresh, 0, true, false, "cached", "warranty valid for 1.00 seconds"},
         {Expired, 0, true, true, "new", "warranty validity expired 0.00 seconds ago, refresh it"},
         {Expired, 0, false, true, "cached", nullptr},
@@ -94,13 +85,12 @@ TEST_F(QAXAgentTest, PolicyDecisionTable) {
     };
     // clang-format on
     const Date now = env.clock->now();
-    for (const auto& row : rows) {
-        SCOPED_TRACE("state " + std::to_string(row.state) + ", policy " +
-                     std::to_string(row.policy));
+    for (const auto& [state, policy, downloadGives, downloaded, reply, message] : rows) {
+        SCOPED_TRACE("state " + std::to_string(state) + ", policy " + std::to_string(policy));
         provider = std::make_shared<test::FakeWarrantyProvider>();
         agent->setWarrantyProvider(provider);
         Cache cache{warranty("cached"), "2", "en_US", now.byAdding(-86399)};
-        switch (row.state) {
+        switch (state) {
             case Fresh:
                 break;
             case Expired:
@@ -126,66 +116,32 @@ TEST_F(QAXAgentTest, PolicyDecisionTable) {
                 break;
         }
         provider->setCache("S", cache);
-        provider->setDownloadResult("S", row.downloadGives ? warranty("new") : nullptr);
+        provider->setDownloadResult("S", downloadGives ? warranty("new") : nullptr);
         env.log->clear();
+        // The evaluation alone acts on nothing; what it would answer without a download is
+        // the reply whenever no new warranty comes.
+        const auto evaluation = QAXAgent::evaluateWarrantyPolicy(
+            *env.platform, *provider, static_cast<QAXWarrantyPolicy>(policy), "S");
+        EXPECT_TRUE(provider->calls().empty());
+        if (std::string(reply) != "new") {
+            EXPECT_EQ(evaluation.answerWithoutDownload() != nullptr,
+                      std::string(reply) == "cached");
+        }
 
         int replies = 0;
         std::string got;
-        agent->getWarrantyUsingPolicy(static_cast<QAXWarrantyPolicy>(row.policy), "S",
+        agent->getWarrantyUsingPolicy(static_cast<QAXWarrantyPolicy>(policy), "S",
                                       [&](std::shared_ptr<QAXWarranty> w) {
                                           ++replies;
                                           got = tagOf(w);
                                       });
         EXPECT_EQ(replies, 1);
-        EXPECT_EQ(got, row.reply);
-        EXPECT_EQ(downloads().size(), row.downloads ? 1u : 0u);
-        if (row.message) {
-            EXPECT_EQ(env.log->count(row.message), 1);
+        EXPECT_EQ(got, reply);
+        EXPECT_EQ(downloads().size(), downloaded ? 1u : 0u);
+        if (message) {
+            EXPECT_EQ(env.log->count(message), 1);
         }
     }
-}
-
-// What the evaluation tells beyond the reply: why a cache is not valid, how much freshness
-// is left, and what is answered when no download happens.
-TEST_F(QAXAgentTest, PolicyEvaluationFacts) {
-    using S = QAXWarrantyPolicyEvaluation::CacheState;
-    const Date now = env.clock->now();
-    struct Row {
-        const char* name;
-        Cache cache;
-        bool signedIn;
-        std::uint64_t policy;
-        S state;
-        std::optional<double> remaining;
-        bool answersCached;
-    };
-    auto c = [&](const char* version, const char* locale, std::optional<Date> updated) {
-        return Cache{warranty("c"), version, locale, updated};
-    };
-    // clang-format off
-    const Row rows[] = {
-        {"fresh", c("2", "en_US", now.byAdding(-86390)), true, 0, S::Valid, 10, true},
-        {"expired", c("2", "en_US", now.byAdding(-86410)), true, 0, S::Valid, -10, true},
-        {"no date", c("2", "en_US", std::nullopt), true, 0, S::Valid, std::nullopt, true},
-        {"forced", c("2", "en_US", now), true, 2, S::Valid, std::nullopt, false},
-        {"cached only", c("2", "en_US", now), true, 1, S::Valid, std::nullopt, true},
-        {"old version", c("1", "en_US", now), true, 0, S::OutdatedVersion, std::nullopt, false},
-        {"other locale", c("2", "fr_FR", now), true, 1, S::OtherLocale, std::nullopt, false},
-        {"signed out", c("2", "en_US", now), false, 1, S::SignedOut, std::nullopt, false},
-        {"none", {}, true, 1, S::None, std::nullopt, false},
-    };
-    // clang-format on
-    for (const auto& row : rows) {
-        SCOPED_TRACE(row.name);
-        provider->setCache("S", row.cache);
-        provider->signedIn = row.signedIn;
-        const auto e = QAXAgent::evaluateWarrantyPolicy(
-            *env.platform, *provider, static_cast<QAXWarrantyPolicy>(row.policy), "S");
-        EXPECT_EQ(e.cacheState, row.state);
-        EXPECT_EQ(e.remaining, row.remaining);
-        EXPECT_EQ(e.answerWithoutDownload() != nullptr, row.answersCached);
-    }
-    EXPECT_TRUE(provider->calls().empty()) << "an evaluation acts on nothing";
 }
 
 TEST_F(QAXAgentTest, AllDevicesJoinWaitsForOverlappingCallsOnOneAgent) {
@@ -242,57 +198,48 @@ TEST_F(QAXAgentTest, AllDevicesJoinWaitsForOverlappingCallsOnOneAgent) {
 
 TEST_F(QAXAgentTest, SerialNumberSubstitutionsWatchesWinOverAccessories) {
     env.platform->preferences->setObject("PairedWatchesSerialNumbers",
-                                         Value(Value::Dictionary{{"X", "W1"}, {"Q", "Q2"}}));
-    env.platform->preferences->setObject(
-        "PairedBluetoothDevicesSerialNumbers",
-        Value(Value::Dictionary{{"X", "ACC"}, {"A", "B"}, {"N", 7}}));
+                                         Value::Dictionary{{"X", "W1"}, {"Q", "Q2"}});
+    env.platform->preferences->setObject("PairedBluetoothDevicesSerialNumbers",
+                                         Value::Dictionary{{"X", "ACC"}, {"A", "B"}, {"N", 7}});
     provider->setDownloadResult("W1", warranty("w1"));
-    struct Row {
-        const char* asked;
-        const char* evaluated;
-        const char* name;
-        QAXDeviceType type;
-    } rows[] = {
+    const std::tuple<const char*, const char*, const char*, QAXDeviceType> rows[] = {
         {"X", "W1", "One", QAXDeviceTypeWatch},
         {"A", "B", "<unknown>", QAXDeviceTypeOther},
         {"N", "N", "<unknown>", QAXDeviceTypeOther},
         {"PHONE1", "PHONE1", "Default Device", QAXDeviceTypeDefault},
     };
-    for (const auto& row : rows) {
-        SCOPED_TRACE(row.asked);
+    for (const auto& [asked, evaluated, name, type] : rows) {
+        SCOPED_TRACE(asked);
         std::shared_ptr<QAXDeviceInfo> info;
-        agent->getDeviceInfoForSerialNumber(row.asked, QAXWarrantyPolicyForceDownload,
+        agent->getDeviceInfoForSerialNumber(asked, QAXWarrantyPolicyForceDownload,
                                             [&](auto i) { info = i; });
         ASSERT_TRUE(info);
-        EXPECT_EQ(info->device()->serialNumber(), row.evaluated);
-        EXPECT_EQ(info->device()->name(), row.name);
-        EXPECT_EQ(info->device()->deviceType(), row.type);
-        if (row.type == QAXDeviceTypeOther) {
+        EXPECT_EQ(info->device()->serialNumber(), evaluated);
+        EXPECT_EQ(info->device()->name(), name);
+        EXPECT_EQ(info->device()->deviceType(), type);
+        if (type == QAXDeviceTypeOther) {
             EXPECT_FALSE(info->device()->activationDate());
         }
-        EXPECT_EQ(downloads().back(), std::string("download ") + row.evaluated);
-        EXPECT_EQ(provider->calls().back(), std::string("refreshOne ") + row.evaluated);
+        EXPECT_EQ(downloads().back(), std::string("download ") + evaluated);
+        EXPECT_EQ(provider->calls().back(), std::string("refreshOne ") + evaluated);
     }
 }
 
 TEST_F(QAXAgentTest, MigrationRunsOnceBeforeVersionTwo) {
-    struct Row {
-        std::int32_t stored;
-        std::vector<std::string> calls;
-    };
     const std::vector<std::string> migrates = {
         "migrateWarranty PHONE1", "migrateFollowUp PHONE1 with warranty", "setMigrationVersion 2"};
-    const Row rows[] = {{0, migrates}, {1, migrates}, {2, {}}, {3, {}}};
-    for (const auto& row : rows) {
-        SCOPED_TRACE(row.stored);
+    const std::pair<std::int32_t, std::vector<std::string>> rows[] = {
+        {0, migrates}, {1, migrates}, {2, {}}, {3, {}}};
+    for (const auto& [stored, calls] : rows) {
+        SCOPED_TRACE(stored);
         provider = std::make_shared<test::FakeWarrantyProvider>();
         provider->legacyWarranty = warranty("legacy");
-        provider->storedMigrationVersion = row.stored;
+        provider->storedMigrationVersion = stored;
         agent->setWarrantyProvider(provider);
         agent->performMigrationIfNeeded();
-        EXPECT_EQ(provider->calls(), row.calls);
+        EXPECT_EQ(provider->calls(), calls);
         agent->performMigrationIfNeeded();  // a second start-up finds version 2
-        EXPECT_EQ(provider->calls(), row.calls);
+        EXPECT_EQ(provider->calls(), calls);
     }
 }
 

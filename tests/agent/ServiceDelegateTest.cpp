@@ -71,12 +71,7 @@ class ServiceDelegateTest : public ::testing::Test {
 };
 
 TEST_F(ServiceDelegateTest, OnlyATrueBooleanOrNonZeroNumberIsAnEntitlement) {
-    struct Case {
-        const char* what;
-        std::optional<Value> value;
-        bool accepted;
-    };
-    const Case cases[] = {
+    const std::tuple<const char*, std::optional<Value>, bool> cases[] = {
         {"absent", std::nullopt, false},
         {"true", Value(true), true},
         {"false", Value(false), false},
@@ -88,21 +83,21 @@ TEST_F(ServiceDelegateTest, OnlyATrueBooleanOrNonZeroNumberIsAnEntitlement) {
         {"string YES", Value("YES"), false},
         {"string 1", Value("1"), false},
         {"date", Value(Date(1)), false},
-        {"dictionary", Value(Value::Dictionary{{"a", Value(true)}}), false},
-        {"array", Value(Value::Array{Value(true)}), false},
+        {"dictionary", Value::Dictionary{{"a", Value(true)}}, false},
+        {"array", Value::Array{Value(true)}, false},
     };
-    for (const auto& c : cases) {
+    for (const auto& [what, value, accepted] : cases) {
         env.log->clear();
         auto connection = std::make_shared<FakeConnection>();
-        if (c.value) {
-            connection->entitlements[kEntitlement] = *c.value;
+        if (value) {
+            connection->entitlements[kEntitlement] = *value;
         }
-        EXPECT_EQ(delegate.shouldAcceptNewConnection(listener, connection), c.accepted) << c.what;
-        EXPECT_EQ(env.log->count(kRejected), c.accepted ? 0 : 1) << c.what;
+        EXPECT_EQ(delegate.shouldAcceptNewConnection(listener, connection), accepted) << what;
+        EXPECT_EQ(env.log->count(kRejected), accepted ? 0 : 1) << what;
         // A refused connection is left exactly as it came.
-        EXPECT_EQ(connection->resumed, c.accepted ? 1 : 0) << c.what;
-        EXPECT_EQ(connection->object != nullptr, c.accepted) << c.what;
-        EXPECT_EQ(connection->interface != nullptr, c.accepted) << c.what;
+        EXPECT_EQ(connection->resumed, accepted ? 1 : 0) << what;
+        EXPECT_EQ(connection->object != nullptr, accepted) << what;
+        EXPECT_EQ(connection->interface != nullptr, accepted) << what;
     }
 }
 
@@ -111,12 +106,7 @@ TEST_F(ServiceDelegateTest, AcceptedClientGetsItsOwnAgentNamedAfterItsBundle) {
         {100, "/opt/settings/bin/settings"}, {200, "/usr/local/bin/tool"}, {300, "/opt/unknown"}};
     processes->bundles = {{"/opt/settings/bin/settings", "com.velmora.Preferences.extension"},
                           {"/usr/local/bin/tool", std::nullopt}};
-    struct Case {
-        pid_t pid;
-        std::string expectedCaller;
-        const char* logged;
-    };
-    const Case cases[] = {
+    const std::tuple<pid_t, std::string, const char*> cases[] = {
         {100, "com.velmora.Preferences.extension",
          "connection added from 100 with calling process: com.velmora.Preferences.extension"},
         // Registered outside any bundle, unknown to the registry, no path at all: all served as
@@ -126,15 +116,15 @@ TEST_F(ServiceDelegateTest, AcceptedClientGetsItsOwnAgentNamedAfterItsBundle) {
         {400, "com.velmora.Preferences", "connection added from 400 with calling process: (null)"},
     };
     std::shared_ptr<ExportedObject> previous;
-    for (const auto& c : cases) {
+    for (const auto& [pid, expectedCaller, logged] : cases) {
         auto connection = std::make_shared<FakeConnection>();
-        connection->pid = c.pid;
+        connection->pid = pid;
         connection->entitlements[kEntitlement] = Value(true);
         ASSERT_TRUE(delegate.shouldAcceptNewConnection(listener, connection));
-        EXPECT_TRUE(env.log->contains(c.logged)) << c.pid;
+        EXPECT_TRUE(env.log->contains(logged)) << pid;
         auto agent = std::dynamic_pointer_cast<QAXAgent>(connection->object);
         ASSERT_NE(agent, nullptr);
-        EXPECT_EQ(agent->callingProcessBundleID(), c.expectedCaller);
+        EXPECT_EQ(agent->callingProcessBundleID(), expectedCaller);
         EXPECT_NE(connection->object, previous) << "agents are never shared";
         EXPECT_NE(std::dynamic_pointer_cast<const QAXAgentRemoteInterface>(connection->interface),
                   nullptr);

@@ -22,11 +22,7 @@ TEST(FileChangeMonitorTest, EveryKindOfChangeVoidsTheStamp) {
     test::TempDir dir;
     const fs::path file = dir.path() / "device.plist";
     const fs::path sibling = dir.path() / "other.plist";
-    struct Row {
-        const char* change;
-        std::function<void()> make;
-    };
-    const Row rows[] = {
+    const std::pair<const char*, std::function<void()>> rows[] = {
         {"rewritten in place", [&] { test::writeFile(file, "second"); }},
         {"replaced by a rename", [&] { ASSERT_TRUE(writeFileAtomically(file.string(), "new")); }},
         {"removed", [&] { fs::remove(file); }},
@@ -41,12 +37,12 @@ TEST(FileChangeMonitorTest, EveryKindOfChangeVoidsTheStamp) {
     };
     FileChangeMonitor& monitor = FileChangeMonitor::shared();
     test::writeFile(file, "first");
-    for (const auto& row : rows) {
+    for (const auto& [change, make] : rows) {
         const std::uint64_t stamp = monitor.stamp(file.string());
-        ASSERT_NE(stamp, 0u) << row.change;
-        EXPECT_TRUE(monitor.holds(file.string(), stamp)) << "nothing changed yet: " << row.change;
-        row.make();
-        EXPECT_FALSE(monitor.holds(file.string(), stamp)) << row.change;
+        ASSERT_NE(stamp, 0u) << change;
+        EXPECT_TRUE(monitor.holds(file.string(), stamp)) << "nothing changed yet: " << change;
+        make();
+        EXPECT_FALSE(monitor.holds(file.string(), stamp)) << change;
     }
 }
 

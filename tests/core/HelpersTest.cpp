@@ -15,28 +15,21 @@ namespace qax {
 namespace {
 
 TEST(VersionCompare, DigitRunsCompareNumerically) {
-    struct Row {
-        const char* a;
-        const char* b;
-        int sign;
-    } rows[] = {
+    const std::tuple<const char*, const char*, int> rows[] = {
         {"4.10", "4.9", 1},  {"4.9", "4.10", -1},    {"4.2", "4.2", 0},
         {"4.2.1", "4.2", 1}, {"4.2", "4.2.1", -1},   {"10.0", "9.9.9", 1},
         {"4.02", "4.2", 0},  {"4.2b", "4.2a", 1},    {"", "", 0},
         {"1", "", 1},        {"12A345", "12A99", 1}, {"99999999999999999999", "1", 1},
     };
-    for (const auto& r : rows) {
-        int c = compareVersions(r.a, r.b);
-        EXPECT_EQ((c > 0) - (c < 0), r.sign) << r.a << " vs " << r.b;
-        EXPECT_EQ(isVersionGreater(r.a, r.b), r.sign > 0) << r.a << " vs " << r.b;
+    for (const auto& [a, b, sign] : rows) {
+        int c = compareVersions(a, b);
+        EXPECT_EQ((c > 0) - (c < 0), sign) << a << " vs " << b;
+        EXPECT_EQ(isVersionGreater(a, b), sign > 0) << a << " vs " << b;
     }
 }
 
 TEST(Sha256Hash, KnownDigests) {
-    struct Row {
-        std::string input;
-        const char* hex;
-    } rows[] = {
+    const std::pair<std::string, const char*> rows[] = {
         {"", "e3b0c44298fc1c149afbf4c8996fb92427ae41e4649b934ca495991b7852b855"},
         {"abc", "ba7816bf8f01cfea414140de5dae2223b00361a396177a9cb410ff61f20015ad"},
         // Only the bytes before the first zero byte count.
@@ -46,26 +39,24 @@ TEST(Sha256Hash, KnownDigests) {
     // Hashes are remembered per thread: asked again, after others pushed them out, and from
     // another thread, the answers stay the same.
     for (int pass = 0; pass < 3; ++pass) {
-        for (const auto& r : rows) {
-            EXPECT_EQ(sha256Hash(r.input), r.hex) << pass;
+        for (const auto& [input, hex] : rows) {
+            EXPECT_EQ(sha256Hash(input), hex) << pass;
         }
         for (int i = 0; i < 2 * pass * 9; ++i) {
             EXPECT_EQ(sha256Hash("C02TESTSERIAL" + std::to_string(i % 9)).size(), 64u);
         }
     }
-    std::thread([&] { EXPECT_EQ(sha256Hash(rows[1].input), rows[1].hex); }).join();
+    std::thread([&] { EXPECT_EQ(sha256Hash(rows[1].first), rows[1].second); }).join();
 }
 
 TEST(Base64, RoundTripsWithPaddingAndNoLineBreaks) {
-    struct Row {
-        std::string raw;
-        const char* encoded;
-    } rows[] = {{"", ""}, {"f", "Zg=="}, {"fo", "Zm8="}, {"foo", "Zm9v"}, {"foob", "Zm9vYg=="}};
-    for (const auto& r : rows) {
-        EXPECT_EQ(base64Encode(r.raw), r.encoded);
-        auto back = base64Decode(r.encoded);
+    const std::pair<std::string, const char*> rows[] = {
+        {"", ""}, {"f", "Zg=="}, {"fo", "Zm8="}, {"foo", "Zm9v"}, {"foob", "Zm9vYg=="}};
+    for (const auto& [raw, encoded] : rows) {
+        EXPECT_EQ(base64Encode(raw), encoded);
+        auto back = base64Decode(encoded);
         ASSERT_TRUE(back);
-        EXPECT_EQ(std::string(back->begin(), back->end()), r.raw);
+        EXPECT_EQ(std::string(back->begin(), back->end()), raw);
     }
     std::string big(1000, 'x');
     EXPECT_EQ(base64Encode(big).find('\n'), std::string::npos);
@@ -74,10 +65,7 @@ TEST(Base64, RoundTripsWithPaddingAndNoLineBreaks) {
 }
 
 TEST(DateFormats, Iso8601ParseAndPrint) {
-    struct Row {
-        const char* text;
-        double seconds;
-    } rows[] = {
+    const std::pair<const char*, double> rows[] = {
         {"2023-11-14T22:13:20Z", 1700000000},
         {"2023-11-14T22:13:20.500Z", 1700000000.5},
         {"2023-11-14T23:13:20+01:00", 1700000000},
@@ -85,10 +73,10 @@ TEST(DateFormats, Iso8601ParseAndPrint) {
         {"1970-01-01", 0},
         {"2286-11-20T17:46:40Z", 10000000000},
     };
-    for (const auto& r : rows) {
-        auto d = Date::parseIso8601(r.text);
-        ASSERT_TRUE(d) << r.text;
-        EXPECT_DOUBLE_EQ(d->secondsSince1970(), r.seconds) << r.text;
+    for (const auto& [text, seconds] : rows) {
+        auto d = Date::parseIso8601(text);
+        ASSERT_TRUE(d) << text;
+        EXPECT_DOUBLE_EQ(d->secondsSince1970(), seconds) << text;
     }
     for (const char* bad :
          {"", "yesterday", "2023-13-01", "2023-11-14T25:00:00Z", "2023-11-14Tx"}) {

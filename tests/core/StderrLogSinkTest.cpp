@@ -9,20 +9,16 @@ namespace qax {
 namespace {
 
 TEST(StderrLogSinkTest, JournalLinesCarryThePriorityOfTheirLevelInsteadOfTheTime) {
-    struct Row {
-        LogLevel level;
-        bool journal;
-        const char* expected;
-    } rows[] = {
+    const std::tuple<LogLevel, bool, const char*> rows[] = {
         {LogLevel::Error, true, "<3>error com.velmora.Kestova:core text\n"},
         {LogLevel::Default, true, "<6>default com.velmora.Kestova:core text\n"},
         {LogLevel::Debug, true, "<7>debug com.velmora.Kestova:core text\n"},
         {LogLevel::Error, false, "2030-01-02 03:04:05.678 error com.velmora.Kestova:core text\n"},
     };
-    for (const auto& row : rows) {
-        EXPECT_EQ(StderrLogSink::formatLine(row.level, kLogSubsystem, kLogCategory, "text",
-                                            "2030-01-02 03:04:05.678", row.journal),
-                  row.expected);
+    for (const auto& [level, journal, expected] : rows) {
+        EXPECT_EQ(StderrLogSink::formatLine(level, kLogSubsystem, kLogCategory, "text",
+                                            "2030-01-02 03:04:05.678", journal),
+                  expected);
     }
 }
 
@@ -34,18 +30,15 @@ TEST(StderrLogSinkTest, OnlyTheStreamJournalStreamNamesIsTheJournal) {
     const std::string self = std::to_string(st.st_dev) + ":" + std::to_string(st.st_ino);
     const std::string other = std::to_string(st.st_dev) + ":" + std::to_string(st.st_ino + 1);
     const std::string trailing = self + "x";
-    struct Row {
-        const char* value;
-        bool journal;
-    } rows[] = {
+    const std::pair<const char*, bool> rows[] = {
         {self.c_str(), true},
         {other.c_str(), false},  // inherited by a process whose stderr was redirected
         {nullptr, false},
         {trailing.c_str(), false},
     };
-    for (const auto& row : rows) {
-        EXPECT_EQ(StderrLogSink::isJournalStream(row.value, fileno(file)), row.journal)
-            << (row.value ? row.value : "(unset)");
+    for (const auto& [value, journal] : rows) {
+        EXPECT_EQ(StderrLogSink::isJournalStream(value, fileno(file)), journal)
+            << (value ? value : "(unset)");
     }
     std::fclose(file);
 }

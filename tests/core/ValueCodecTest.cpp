@@ -75,8 +75,8 @@ TEST(ValueCodec, DatesAndDataSurvivePropertyLists) {
         EXPECT_EQ(back->find("before2001")->asDate()->secondsSince1970(), 86400.0);
     }
     // A JSON rendering names dates in ISO 8601 and data in base64.
-    EXPECT_EQ(toJsonString(Value(Value::Dictionary{{"d", Value(Date(1700000000))},
-                                                   {"b", Value(Value::Data{1, 2, 3})}})),
+    EXPECT_EQ(toJsonString(Value::Dictionary{{"d", Value(Date(1700000000))},
+                                             {"b", Value(Value::Data{1, 2, 3})}}),
               R"({"b":"AQID","d":"2023-11-14T22:13:20.000Z"})");
 }
 
@@ -115,7 +115,7 @@ TEST(ValueCodec, ReadsHandWrittenXmlPlist) {
     EXPECT_TRUE(v->find("Ratio")->isReal());
     EXPECT_EQ(v->find("Paired")->asDate()->iso8601(), "2024-01-02T03:04:05.000Z");
     EXPECT_EQ(*v->find("Blob"), Value(Value::Data{1, 2, 3}));
-    EXPECT_EQ(*v->find("Empty"), Value(Value::Dictionary{}));
+    EXPECT_EQ(*v->find("Empty"), Value::Dictionary{});
     EXPECT_EQ(v->find("List")->size(), 2u);
 }
 
@@ -136,14 +136,14 @@ TEST(ValueCodec, HostileDocumentsAreRefusedBeforeParsing) {
     // A binary document nested too deeply, made by our own writer.
     Value deep(1);
     for (int i = 0; i < kMaxValueDepth + 5; ++i) {
-        deep = Value(Value::Array{deep});
+        deep = Value::Array{deep};
     }
     auto bin = toBinaryPlist(deep);
     ASSERT_TRUE(bin);
     EXPECT_FALSE(parsePlist(*bin));
 
     // Damaged binary documents: every truncation and a corrupt trailer are refused safely.
-    auto good = toBinaryPlist(Value(Value::Dictionary{{"a", Value(Value::Array{1, 2, 3})}}));
+    auto good = toBinaryPlist(Value::Dictionary{{"a", Value(Value::Array{1, 2, 3})}});
     ASSERT_TRUE(good);
     for (std::size_t n = 0; n < good->size(); n += 3) {
         (void)parsePlist(good->substr(0, n));  // must not crash

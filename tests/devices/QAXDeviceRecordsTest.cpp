@@ -21,28 +21,23 @@ Value overTheWire(const Value& archive) {
 }
 
 TEST(QAXDeviceTest, ArchiveRoundTripKeepsEveryField) {
-    struct Case {
-        std::optional<std::string> name;
-        std::optional<std::string> serial;
-        std::optional<Date> activated;
-        QAXDeviceType type;
-        const char* typeString;
-    };
-    const Case cases[] = {
-        {"Default Device", "C02SERIAL", Date(1'700'000'000), QAXDeviceTypeDefault, "Default"},
-        {"Morning Watch", "W1", Date(1'600'000'000.5), QAXDeviceTypeWatch, "Watch"},
-        {"<unknown>", "X9", std::nullopt, QAXDeviceTypeOther, "Other"},
-        {std::nullopt, std::nullopt, std::nullopt, static_cast<QAXDeviceType>(7), "Default"},
-    };
-    for (const auto& c : cases) {
-        auto device = QAXDevice::deviceWithName(c.name, c.serial, c.activated, c.type);
+    const std::tuple<std::optional<std::string>, std::optional<std::string>, std::optional<Date>,
+                     QAXDeviceType, const char*>
+        cases[] = {
+            {"Default Device", "C02SERIAL", Date(1'700'000'000), QAXDeviceTypeDefault, "Default"},
+            {"Morning Watch", "W1", Date(1'600'000'000.5), QAXDeviceTypeWatch, "Watch"},
+            {"<unknown>", "X9", std::nullopt, QAXDeviceTypeOther, "Other"},
+            {std::nullopt, std::nullopt, std::nullopt, static_cast<QAXDeviceType>(7), "Default"},
+        };
+    for (const auto& [name, serial, activated, type, typeString] : cases) {
+        auto device = QAXDevice::deviceWithName(name, serial, activated, type);
         auto decoded = QAXDevice::decode(overTheWire(device->encode()));
         ASSERT_NE(decoded, nullptr) << device->description();
-        EXPECT_EQ(decoded->name(), c.name);
-        EXPECT_EQ(decoded->serialNumber(), c.serial);
-        EXPECT_EQ(decoded->activationDate(), c.activated);
-        EXPECT_EQ(decoded->deviceType(), c.type);
-        EXPECT_EQ(decoded->deviceTypeString(), c.typeString);
+        EXPECT_EQ(decoded->name(), name);
+        EXPECT_EQ(decoded->serialNumber(), serial);
+        EXPECT_EQ(decoded->activationDate(), activated);
+        EXPECT_EQ(decoded->deviceType(), type);
+        EXPECT_EQ(decoded->deviceTypeString(), typeString);
     }
 }
 
@@ -66,13 +61,13 @@ TEST(QAXDeviceTest, DecodingRefusesWrongClassesAndKinds) {
         {"activation date is a string", with("activationDate", "2024-01-01")},
         {"device type is a string", with("deviceType", "1")},
         {"device type is a real", with("deviceType", 1.5)},
-        {"not a dictionary", Value(Value::Array{good})},
+        {"not a dictionary", Value::Array{good}},
     };
     for (const auto& [what, archive] : refused) {
         EXPECT_EQ(QAXDevice::decode(archive), nullptr) << what;
     }
     // Missing keys are none, and a missing type is the default one.
-    auto sparse = QAXDevice::decode(Value(Value::Dictionary{{"$class", Value("QAXDevice")}}));
+    auto sparse = QAXDevice::decode(Value::Dictionary{{"$class", Value("QAXDevice")}});
     ASSERT_NE(sparse, nullptr);
     EXPECT_FALSE(sparse->name());
     EXPECT_FALSE(sparse->activationDate());
@@ -83,7 +78,7 @@ class QAXDeviceInfoTest : public ::testing::Test {
   protected:
     std::shared_ptr<QAXWarranty> warranty(const char* offerId) {
         return QAXWarranty::initWithDictionary(
-            env.platform, Value(Value::Dictionary{{"hvOfferIdentifier", Value(offerId)}}));
+            env.platform, Value::Dictionary{{"hvOfferIdentifier", Value(offerId)}});
     }
     test::TestPlatform env;
 };
@@ -95,25 +90,23 @@ TEST_F(QAXDeviceInfoTest, EqualityNeedsTheSameDeviceObjectAndEqualWarranties) {
     auto sameSummary = warranty("offer-1");
     auto other = warranty("offer-2");
 
-    struct Case {
-        const char* what;
-        std::shared_ptr<QAXDeviceInfo> lhs, rhs;
-        bool equal;
-    };
-    const Case cases[] = {
-        {"shared device, equal warranties", QAXDeviceInfo::deviceInfoWithDevice(device, a),
-         QAXDeviceInfo::deviceInfoWithDevice(device, sameSummary), true},
-        {"shared device, different warranties", QAXDeviceInfo::deviceInfoWithDevice(device, a),
-         QAXDeviceInfo::deviceInfoWithDevice(device, other), false},
-        {"equal-looking devices built separately", QAXDeviceInfo::deviceInfoWithDevice(device, a),
-         QAXDeviceInfo::deviceInfoWithDevice(twin, a), false},
-        {"both warranties none", QAXDeviceInfo::deviceInfoWithDevice(device, nullptr),
-         QAXDeviceInfo::deviceInfoWithDevice(device, nullptr), false},
-        {"no devices", QAXDeviceInfo::deviceInfoWithDevice(nullptr, a),
-         QAXDeviceInfo::deviceInfoWithDevice(nullptr, a), false},
-    };
-    for (const auto& c : cases) {
-        EXPECT_EQ(c.lhs->isEqual(c.rhs.get()), c.equal) << c.what;
+    const std::tuple<const char*, std::shared_ptr<QAXDeviceInfo>, std::shared_ptr<QAXDeviceInfo>,
+                     bool>
+        cases[] = {
+            {"shared device, equal warranties", QAXDeviceInfo::deviceInfoWithDevice(device, a),
+             QAXDeviceInfo::deviceInfoWithDevice(device, sameSummary), true},
+            {"shared device, different warranties", QAXDeviceInfo::deviceInfoWithDevice(device, a),
+             QAXDeviceInfo::deviceInfoWithDevice(device, other), false},
+            {"equal-looking devices built separately",
+             QAXDeviceInfo::deviceInfoWithDevice(device, a),
+             QAXDeviceInfo::deviceInfoWithDevice(twin, a), false},
+            {"both warranties none", QAXDeviceInfo::deviceInfoWithDevice(device, nullptr),
+             QAXDeviceInfo::deviceInfoWithDevice(device, nullptr), false},
+            {"no devices", QAXDeviceInfo::deviceInfoWithDevice(nullptr, a),
+             QAXDeviceInfo::deviceInfoWithDevice(nullptr, a), false},
+        };
+    for (const auto& [what, lhs, rhs, equal] : cases) {
+        EXPECT_EQ(lhs->isEqual(rhs.get()), equal) << what;
     }
     auto info = QAXDeviceInfo::deviceInfoWithDevice(device, a);
     EXPECT_FALSE(info->isEqual(nullptr));

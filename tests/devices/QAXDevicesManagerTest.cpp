@@ -27,8 +27,8 @@ class QAXDevicesManagerTest : public ::testing::Test {
     }
     void serverVersions(int low, int high) {
         prefs()->setObject("ServerVersionOverride",
-                           Value(Value::Dictionary{{"LowServerVersion", Value(low)},
-                                                   {"HighServerVersion", Value(high)}}));
+                           Value::Dictionary{{"LowServerVersion", Value(low)},
+                                             {"HighServerVersion", Value(high)}});
     }
     std::vector<std::string> serials(const QAXDeviceMap& devices) {
         std::vector<std::string> out;
@@ -65,7 +65,7 @@ TEST_F(QAXDevicesManagerTest, DefaultDeviceSerialNumberAndOverride) {
     EXPECT_TRUE(manager.allDevices().empty()) << "a device without a serial number has no key";
 }
 
-TEST_F(QAXDevicesManagerTest, PairedWatchesAreGatedByFlagAndServer) {
+TEST_F(QAXDevicesManagerTest, PairedWatchesAreGatedByFlagAndServerAndWinInAllDevices) {
     registry->setDevices({test::FakePairedDeviceRegistry::watch("W", "W1", Date(100))});
     EXPECT_EQ(serials(manager.pairedDevices()), std::vector<std::string>{"W1"});
 
@@ -76,6 +76,16 @@ TEST_F(QAXDevicesManagerTest, PairedWatchesAreGatedByFlagAndServer) {
     flags->set("Kestova", "Tessel_3_0", true);
     serverVersions(1, 2);  // the agent's high version 3 is not offered
     EXPECT_TRUE(manager.pairedDevices().empty());
+
+    // All devices by serial number: a paired entry wins over this device's.
+    serverVersions(2, 3);
+    registry->setDevices(
+        {test::FakePairedDeviceRegistry::watch("W", "W1", Date(1)),
+         test::FakePairedDeviceRegistry::watch("Clash", "C02TESTSERIAL", Date(2))});
+    auto all = manager.allDevices();
+    ASSERT_EQ(serials(all), (std::vector<std::string>{"C02TESTSERIAL", "W1"}));
+    EXPECT_EQ(all["C02TESTSERIAL"]->deviceType(), QAXDeviceTypeWatch);
+    EXPECT_EQ(all["C02TESTSERIAL"]->name(), "Clash");
 }
 
 TEST_F(QAXDevicesManagerTest, OnlyActivePairedWatchesWithSerialNumbersAreListed) {
@@ -108,7 +118,7 @@ TEST_F(QAXDevicesManagerTest, OnlyActivePairedWatchesWithSerialNumbersAreListed)
 TEST_F(QAXDevicesManagerTest, InternalOverrideListReplacesTheRegistry) {
     registry->setDevices({test::FakePairedDeviceRegistry::watch("Real", "REAL", Date(1))});
     prefs()->setObject("PairedWatchesSerialNumbers",
-                       Value(Value::Dictionary{{"A", Value("W1")}, {"B", Value("W2")}}));
+                       Value::Dictionary{{"A", Value("W1")}, {"B", Value("W2")}});
     prefs()->setObject("W1.activationInterval", -86400);
 
     // Not internal: the override list is ignored.
@@ -123,18 +133,8 @@ TEST_F(QAXDevicesManagerTest, InternalOverrideListReplacesTheRegistry) {
     EXPECT_EQ(paired["W2"]->activationDate(), now);
     EXPECT_EQ(paired["W1"]->deviceType(), QAXDeviceTypeWatch);
 
-    prefs()->setObject("PairedWatchesSerialNumbers", Value(Value::Dictionary{}));
+    prefs()->setObject("PairedWatchesSerialNumbers", Value::Dictionary{});
     EXPECT_TRUE(manager.pairedDevices().empty()) << "an empty override hides the real watches";
-}
-
-TEST_F(QAXDevicesManagerTest, AllDevicesMergesBySerialAndPrefersPairedEntries) {
-    registry->setDevices(
-        {test::FakePairedDeviceRegistry::watch("W", "W1", Date(1)),
-         test::FakePairedDeviceRegistry::watch("Clash", "C02TESTSERIAL", Date(2))});
-    auto all = manager.allDevices();
-    ASSERT_EQ(serials(all), (std::vector<std::string>{"C02TESTSERIAL", "W1"}));
-    EXPECT_EQ(all["C02TESTSERIAL"]->deviceType(), QAXDeviceTypeWatch);
-    EXPECT_EQ(all["C02TESTSERIAL"]->name(), "Clash");
 }
 
 }  // namespace

@@ -99,30 +99,25 @@ TEST_F(MonitorsTest, PairingEventsFromEverywhereStartOneRefreshAtATime) {
 }
 
 TEST_F(MonitorsTest, LanguageChangeRefreshesOnlyWhileAFollowUpIsShown) {
-    struct Row {
-        const char* what;
-        std::uint64_t pending;
-        std::vector<double> notifiedAt;  // seconds from the start
-        int refreshes;
-    };
-    const Row rows[] = {
+    // Follow-ups shown, the changes (seconds from the start), the refreshes that follow.
+    const std::tuple<const char*, std::uint64_t, std::vector<double>, int> rows[] = {
         {"nothing shown", 0, {0}, 0},
         {"one follow-up shown", 1, {0}, 1},
         {"two changes a second apart", 2, {0, 1}, 2},
     };
-    for (const Row& row : rows) {
-        SCOPED_TRACE(row.what);
+    for (const auto& [what, pending, notifiedAt, refreshes] : rows) {
+        SCOPED_TRACE(what);
         test::TestPlatform env;
         auto center = std::make_shared<test::FakeNotificationCenter>();
         env.platform->notifications = center;
         auto refreshAgent = std::make_shared<test::FakeAgent>();
-        auto monitor = std::make_shared<QAXLocaleMonitor>(env.platform, refreshAgent,
-                                                          [&] { return row.pending; });
+        auto monitor =
+            std::make_shared<QAXLocaleMonitor>(env.platform, refreshAgent, [&] { return pending; });
         monitor->start();
         auto& lifecycle = static_cast<test::FakeProcessLifecycle&>(*env.platform->lifecycle);
 
         double now = 0;
-        for (double at : row.notifiedAt) {
+        for (double at : notifiedAt) {
             env.runner->advanceBy(at - now);
             now = at;
             center->postNotification("com.velmora.language.changed");
@@ -134,9 +129,9 @@ TEST_F(MonitorsTest, LanguageChangeRefreshesOnlyWhileAFollowUpIsShown) {
         EXPECT_TRUE(refreshAgent->requests().empty());
         env.runner->advanceBy(10);
 
-        const int changes = static_cast<int>(row.notifiedAt.size());
+        const int changes = static_cast<int>(notifiedAt.size());
         EXPECT_EQ(lifecycle.cleanExitRequests, changes);
-        EXPECT_EQ(static_cast<int>(refreshAgent->requests().size()), row.refreshes);
+        EXPECT_EQ(static_cast<int>(refreshAgent->requests().size()), refreshes);
         for (const auto& request : refreshAgent->requests()) {
             EXPECT_EQ(request.policy, QAXWarrantyPolicyDefault);
             EXPECT_TRUE(request.updateFollowUps);

@@ -18,9 +18,20 @@ class RecordingAnalyticsSink : public AnalyticsSink {
         Value payload;
     };
 
-    void sendEventLazily(const std::string& name, std::function<Value()> payload) override;
+    void sendEventLazily(const std::string& name, std::function<Value()> payload) override {
+        if (!enabled) {
+            return;
+        }
+        // Built outside the lock: the payload callback logs.
+        Value built = payload();
+        std::lock_guard lock(mutex_);
+        events_.push_back({name, std::move(built)});
+    }
 
-    std::vector<Event> events() const;
+    std::vector<Event> events() const {
+        std::lock_guard lock(mutex_);
+        return events_;
+    }
     std::atomic<bool> enabled{true};
 
   private:

@@ -10,17 +10,6 @@ class EmptyCertificate : public AttestationCertificate {
 
 }  // namespace
 
-std::shared_ptr<const AccessControl> ScriptedAttestationService::createPrivateKeyAccessControl(
-    KeyAccessibility accessibility, std::string* error) {
-    if (accessControlFails) {
-        if (error) {
-            *error = "access control refused";
-        }
-        return nullptr;
-    }
-    return target_->createPrivateKeyAccessControl(accessibility, error);
-}
-
 void ScriptedAttestationService::issueClientCertificate(const AttestationOptions& options,
                                                         Completion completion) {
     Step step;
@@ -70,11 +59,6 @@ void ScriptedAttestationService::issueClientCertificate(const AttestationOptions
                           chain = std::move(chain),
                           error = std::move(error)] { completion(key, chain, error); });
         });
-}
-
-std::vector<AttestationOptions> ScriptedAttestationService::calls() {
-    std::lock_guard lock(mutex_);
-    return calls_;
 }
 
 void ScriptedAttestationService::releaseHeldCompletion() {

@@ -32,7 +32,13 @@ class ScriptedAttestationService : public AttestationService {
 
     bool isAttestationSupported() override { return supported; }
     std::shared_ptr<const AccessControl> createPrivateKeyAccessControl(
-        KeyAccessibility accessibility, std::string* error) override;
+        KeyAccessibility accessibility, std::string* error) override {
+        if (accessControlFails && error) {
+            *error = "access control refused";
+        }
+        return accessControlFails ? nullptr
+                                  : target_->createPrivateKeyAccessControl(accessibility, error);
+    }
     // Takes the next step of the script (Forward once the script is used up).
     void issueClientCertificate(
         const AttestationOptions& options,
@@ -45,7 +51,10 @@ class ScriptedAttestationService : public AttestationService {
 
     // Joins the threads that ran completions.
     void drain() { threads_.drain(); }
-    std::vector<AttestationOptions> calls();
+    std::vector<AttestationOptions> calls() {
+        std::lock_guard lock(mutex_);
+        return calls_;
+    }
     // Calls the kept completion of a Never step now, with the target's answer.
     void releaseHeldCompletion();
 

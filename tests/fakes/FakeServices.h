@@ -17,14 +17,46 @@ namespace qax::test {
 
 class InMemoryPreferenceStore : public PreferenceStore {
   public:
-    void registerDefaults(const Value::Dictionary& defaults) override;
-    std::optional<Value> objectForKey(std::string_view key) override;
-    bool setObject(std::string_view key, const Value& value) override;
-    bool removeObject(std::string_view key) override;
-    std::vector<std::string> allKeys() override;
+    void registerDefaults(const Value::Dictionary& defaults) override {
+        std::lock_guard lock(mutex_);
+        for (const auto& [k, v] : defaults) {
+            defaults_.insert_or_assign(k, v);
+        }
+    }
+    std::optional<Value> objectForKey(std::string_view key) override {
+        std::lock_guard lock(mutex_);
+        auto it = stored_.find(key);
+        if (it == stored_.end() && (it = defaults_.find(key)) == defaults_.end()) {
+            return std::nullopt;
+        }
+        return it->second;
+    }
+    bool setObject(std::string_view key, const Value& value) override {
+        std::lock_guard lock(mutex_);
+        stored_.insert_or_assign(std::string(key), value);
+        return true;
+    }
+    bool removeObject(std::string_view key) override {
+        std::lock_guard lock(mutex_);
+        if (auto it = stored_.find(key); it != stored_.end()) {
+            stored_.erase(it);
+        }
+        return true;
+    }
+    std::vector<std::string> allKeys() override {
+        std::lock_guard lock(mutex_);
+        std::vector<std::string> keys;
+        for (const auto& [k, v] : stored_) {
+            keys.push_back(k);
+        }
+        return keys;
+    }
 
     // Whether a value is stored (registered defaults do not count).
-    bool hasStoredValue(std::string_view key);
+    bool hasStoredValue(std::string_view key) {
+        std::lock_guard lock(mutex_);
+        return stored_.find(key) != stored_.end();
+    }
 
   private:
     std::mutex mutex_;
@@ -34,10 +66,21 @@ class InMemoryPreferenceStore : public PreferenceStore {
 
 class FakeDeviceProperties : public DeviceProperties {
   public:
-    std::optional<Value> copyDeviceProperty(std::string_view name) override;
+    std::optional<Value> copyDeviceProperty(std::string_view name) override {
+        std::lock_guard lock(mutex_);
+        auto it = properties_.find(name);
+        return it == properties_.end() ? std::nullopt : std::optional<Value>(it->second);
+    }
     bool isInternalBuild() override { return internal; }
 
-    void set(const std::string& name, std::optional<Value> value);
+    void set(const std::string& name, std::optional<Value> value) {
+        std::lock_guard lock(mutex_);
+        if (value) {
+            properties_.insert_or_assign(name, *value);
+        } else {
+            properties_.erase(name);
+        }
+    }
 
     bool internal = false;
 

@@ -13,9 +13,15 @@ namespace qax::test {
 class FakeUserInterfaceStrings : public UserInterfaceStrings {
   public:
     std::string localizedString(std::string_view key, std::string_view defaultValue,
-                                std::string_view table) override;
-
-    void set(const std::string& key, const std::string& text);
+                                std::string_view) override {
+        std::lock_guard lock(mutex_);
+        auto it = texts_.find(key);
+        return it == texts_.end() ? std::string(defaultValue) : it->second;
+    }
+    void set(const std::string& key, const std::string& text) {
+        std::lock_guard lock(mutex_);
+        texts_.insert_or_assign(key, text);
+    }
 
   private:
     mutable std::mutex mutex_;

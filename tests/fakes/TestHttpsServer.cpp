@@ -51,6 +51,39 @@ void TestHttpsServer::stop() {
     }
 }
 
+void TestHttpsServer::answer(const std::string& path, Answer standing) {
+    setAnswer(path, std::move(standing));
+    auto handler = [this](const httplib::Request& req, httplib::Response& res) {
+        std::lock_guard lock(mutex_);
+        requests_.push_back({req.method, req.path, req.body, req.headers});
+        Route& route = routes_[req.path];
+        Answer answer = route.queued.empty() ? route.standing : route.queued.front();
+        if (!route.queued.empty()) {
+            route.queued.pop_front();
+        }
+        res.status = answer.status;
+        res.headers = answer.headers;
+        res.set_content(answer.body, answer.contentType);
+    };
+    server_->Get(path, handler);
+    server_->Post(path, handler);
+}
+
+void TestHttpsServer::setAnswer(const std::string& path, Answer standing) {
+    std::lock_guard lock(mutex_);
+    routes_[path].standing = std::move(standing);
+}
+
+void TestHttpsServer::queue(const std::string& path, std::deque<Answer> answers) {
+    std::lock_guard lock(mutex_);
+    routes_[path].queued = std::move(answers);
+}
+
+std::vector<TestHttpsServer::Request> TestHttpsServer::requests() {
+    std::lock_guard lock(mutex_);
+    return requests_;
+}
+
 std::string TestHttpsServer::url(const std::string& path) const {
     return "https://127.0.0.1:" + std::to_string(port_) + path;
 }

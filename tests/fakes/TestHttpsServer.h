@@ -5,9 +5,13 @@
 
 #include <httplib.h>
 
+#include <deque>
+#include <map>
 #include <memory>
+#include <mutex>
 #include <string>
 #include <thread>
+#include <vector>
 
 #include "fakes/TestPlatform.h"
 
@@ -21,6 +25,30 @@ class TestHttpsServer {
     TestHttpsServer& operator=(const TestHttpsServer&) = delete;
 
     httplib::SSLServer& server() { return *server_; }
+
+    struct Answer {
+        Answer(int status = 200, std::string body = "",
+               std::string contentType = "application/json", httplib::Headers headers = {})
+            : status(status),
+              body(std::move(body)),
+              contentType(std::move(contentType)),
+              headers(std::move(headers)) {}
+        int status;
+        std::string body, contentType;
+        httplib::Headers headers;
+    };
+    struct Request {
+        std::string method, path, body;
+        httplib::Headers headers;
+    };
+    // Serves GET and POST on `path` (register before start()): the queued answers in order,
+    // then the standing one. Either can be changed at any time.
+    void answer(const std::string& path, Answer standing);
+    void setAnswer(const std::string& path, Answer standing);
+    // Replaces the queue of `path`.
+    void queue(const std::string& path, std::deque<Answer> answers);
+    // Every request to a path served by answer(), in arrival order.
+    std::vector<Request> requests();
     // Binds a free port and serves on a thread of its own.
     void start();
     void stop();
@@ -34,6 +62,13 @@ class TestHttpsServer {
     void trustIn(const std::string& platformRoot) const;
 
   private:
+    struct Route {
+        Answer standing;
+        std::deque<Answer> queued;
+    };
+    std::mutex mutex_;
+    std::map<std::string, Route> routes_;
+    std::vector<Request> requests_;
     TempDir dir_;
     std::unique_ptr<httplib::SSLServer> server_;
     std::thread thread_;

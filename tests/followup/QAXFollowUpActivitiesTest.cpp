@@ -55,8 +55,8 @@ class FollowUpActivitiesTest : public ::testing::Test {
             Value::Dictionary summary{
                 {"hvLocalizedOfferPluralDescFormat", "%@ days left"},
                 {"featureToggleParameters",
-                 Value(Value::Dictionary{{"hvOfferDisplay", d.displayed},
-                                         {"hvOfferDurationDaysBeforeEndDate", 30}})}};
+                 Value::Dictionary{{"hvOfferDisplay", d.displayed},
+                                   {"hvOfferDurationDaysBeforeEndDate", 30}}}};
             for (auto [key, offset] : {std::pair{"hvOfferFollowupDisplayDate", d.display},
                                        std::pair{"hvOfferEligibleUntil", d.until}}) {
                 if (offset) {
@@ -87,11 +87,10 @@ class FollowUpActivitiesTest : public ::testing::Test {
         tp.runner->runUntilIdle();
         return results;
     }
-    std::size_t items() {
-        return std::static_pointer_cast<test::InMemoryFollowUpCenter>(tp.platform->followUps)
-            ->items(kClient)
-            .size();
+    test::InMemoryFollowUpCenter& center() {
+        return static_cast<test::InMemoryFollowUpCenter&>(*tp.platform->followUps);
     }
+    std::size_t items() { return center().items(kClient).size(); }
 
     test::TestPlatform tp;
     PreferenceStore& prefs = *tp.platform->preferences;
@@ -189,22 +188,16 @@ TEST_F(FollowUpActivitiesTest, RunsPostRefreshAndScheduleWhatComesNext) {
         tp.log->clear();
         prefs.removeObject(QAXScheduler::targetDateKey(kPost));
         prefs.removeObject(QAXScheduler::targetDateKey(kRefresh));
-        std::static_pointer_cast<test::InMemoryFollowUpCenter>(tp.platform->followUps)
-            ->clearPendingFollowUpItemsWithUniqueIdentifiers(
-                kClient, {QAXFollowUp::uniqueIdentfierForSerialNumber(std::string("A"))}, nullptr);
+        center().setItems(kClient, {});
         if (!row.post) {
             QAXFollowUp(tp.platform).postFollowUpWithDeviceInfo(infos({shown})[0]);
         }
         agent->setInfos(row.reply ? infos(*row.reply) : QAXDeviceInfoList{});
         factory().setAgent(row.reply ? agent : nullptr);
 
-        std::shared_ptr<QAXSchedulerActivityDelegate> activity;
-        if (row.post) {
-            activity = std::make_shared<QAXFollowUpPost>(tp.platform);
-        } else {
-            activity = std::make_shared<QAXFollowUpRefresh>(tp.platform);
-        }
-        EXPECT_EQ(*run(activity), std::vector<std::int64_t>{row.result});
+        const auto results = row.post ? run(std::make_shared<QAXFollowUpPost>(tp.platform))
+                                      : run(std::make_shared<QAXFollowUpRefresh>(tp.platform));
+        EXPECT_EQ(*results, std::vector<std::int64_t>{row.result});
         EXPECT_EQ(items(), row.itemsAfter);
         EXPECT_EQ(target(kPost), at(row.nextPost));
         EXPECT_EQ(target(kRefresh), at(row.nextRefresh));
@@ -222,36 +215,31 @@ TEST_F(FollowUpActivitiesTest, RunsPostRefreshAndScheduleWhatComesNext) {
 }
 
 TEST_F(FollowUpActivitiesTest, PostRunIsReportedOnceWhicheverPathEndsIt) {
-    struct Row {
-        const char* what;
-        bool shouldDefer, timerFirst;
-        std::int64_t reported;
-    };
-    const Row rows[] = {
+    const std::tuple<const char*, bool, bool, std::int64_t> rows[] = {
         {"deferral check first", true, true, QAXActivityResultDeferred},
         {"reply first", true, false, QAXActivityResultFinished},
         {"the platform does not ask to defer", false, true, QAXActivityResultFinished},
     };
-    for (const Row& row : rows) {
-        SCOPED_TRACE(row.what);
+    for (const auto& [what, shouldDefer, timerFirst, reported] : rows) {
+        SCOPED_TRACE(what);
         tp.log->clear();
         std::static_pointer_cast<test::FakeBackgroundActivityScheduler>(tp.platform->activities)
             ->activity(kPost)
-            ->setShouldDefer(row.shouldDefer);
+            ->setShouldDefer(shouldDefer);
         agent->setInfos(infos({{"A", -10 * kDay, -kDay, 30 * kDay}}));
         agent->hold(true);
         auto activity = std::make_shared<QAXFollowUpPost>(tp.platform);
         activity->setDeferralCheckInterval(10);
         auto results = run(activity);
         EXPECT_TRUE(activity->followUpPostInProgress());
-        if (row.timerFirst) {
+        if (timerFirst) {
             tp.runner->advanceBy(35);
         }
         EXPECT_EQ(agent->release(), 1u);
         tp.runner->advanceBy(35);
-        EXPECT_EQ(*results, std::vector<std::int64_t>{row.reported});
+        EXPECT_EQ(*results, std::vector<std::int64_t>{reported});
         EXPECT_EQ(tp.log->count("FollowUp Post activity deferred."),
-                  row.reported == QAXActivityResultDeferred ? 1 : 0);
+                  reported == QAXActivityResultDeferred ? 1 : 0);
         // The reply's work is done either way, and the run leaves nothing behind.
         EXPECT_EQ(items(), 1u);
         EXPECT_FALSE(activity->followUpPostInProgress() || activity->followUpPostTimer());

@@ -1,7 +1,6 @@
 #include <gtest/gtest.h>
 
 #include <latch>
-#include <regex>
 
 #include "core/AsioDispatcher.h"
 #include "core/Hash.h"
@@ -40,8 +39,7 @@ class QAXFollowUpTest : public ::testing::Test {
             {"hvLocalizedOfferSingularDesc", "Last day to buy"},
             {"hvLocalizedOfferPluralDescFormat", "%@ days left to buy"},
             {"featureToggleParameters",
-             Value(Value::Dictionary{{"hvOfferDisplay", true},
-                                     {"hvOfferDurationDaysBeforeEndDate", 45}})},
+             Value::Dictionary{{"hvOfferDisplay", true}, {"hvOfferDurationDaysBeforeEndDate", 45}}},
         };
     }
     std::shared_ptr<QAXDeviceInfo> info(const std::optional<std::string>& serial,
@@ -58,7 +56,7 @@ class QAXFollowUpTest : public ::testing::Test {
     }
     FollowUpItem pendingItemFor(const std::string& serial, std::optional<std::string> id = {}) {
         FollowUpItem item;
-        item.uniqueIdentifier = id ? *id : QAXFollowUp::uniqueIdentfierForSerialNumber(serial);
+        item.uniqueIdentifier = id.value_or(QAXFollowUp::uniqueIdentfierForSerialNumber(serial));
         item.groupIdentifier = "group.kept";
         item.displayStyle = 2;
         item.userInfo = {{"FollowupSerialNumber", Value(serial)}};
@@ -84,25 +82,19 @@ class QAXFollowUpTest : public ::testing::Test {
 
 TEST_F(QAXFollowUpTest, PostedItemIdentifiesAndTargetsTheDevice) {
     EXPECT_EQ(QAXFollowUp::uniqueIdentfierForSerialNumber(std::nullopt), kClient);
-    EXPECT_TRUE(std::regex_match(QAXFollowUp::uniqueIdentfierForSerialNumber("C02XYZ"),
-                                 std::regex("com\\.velmora\\.Kestova\\.[0-9a-f]{64}")));
 
-    struct Row {
-        QAXDeviceType type;
-        std::optional<std::string> target;
-        const char* typeText;
-    };
-    const Row rows[] = {{QAXDeviceTypeDefault, "com.velmora.Preferences", "Default"},
-                        {QAXDeviceTypeWatch, "com.velmora.Bridge", "Watch"},
-                        {QAXDeviceTypeOther, std::nullopt, "Other"}};
-    for (const Row& row : rows) {
-        SCOPED_TRACE(row.typeText);
-        const std::string serial = std::string("SN-") + row.typeText;
-        followUp.postFollowUpWithDeviceInfo(info(serial, offer(30), row.type));
+    const std::tuple<QAXDeviceType, std::optional<std::string>, const char*> rows[] = {
+        {QAXDeviceTypeDefault, "com.velmora.Preferences", "Default"},
+        {QAXDeviceTypeWatch, "com.velmora.Bridge", "Watch"},
+        {QAXDeviceTypeOther, std::nullopt, "Other"}};
+    for (const auto& [type, target, typeText] : rows) {
+        SCOPED_TRACE(typeText);
+        const std::string serial = std::string("SN-") + typeText;
+        followUp.postFollowUpWithDeviceInfo(info(serial, offer(30), type));
         auto item = pending(serial);
         ASSERT_TRUE(item);
         EXPECT_EQ(item->uniqueIdentifier, std::string(kClient) + "." + sha256Hash(serial));
-        EXPECT_EQ(item->targetBundleIdentifier, row.target);
+        EXPECT_EQ(item->targetBundleIdentifier, target);
         EXPECT_EQ(item->groupIdentifier, "com.velmora.followup.group.qax");
         EXPECT_EQ(item->extensionIdentifier, "com.velmora.Kestova.Extension");
         EXPECT_EQ(item->title, "Haverly for your phone");
@@ -119,13 +111,13 @@ TEST_F(QAXFollowUpTest, PostedItemIdentifiesAndTargetsTheDevice) {
         EXPECT_FALSE(item->actions[0].url);
         EXPECT_TRUE(logged("Posted follow-up: serialNumber:" + serial + " -> success"));
         EXPECT_EQ(analytics->events().back().payload,
-                  Value(Value::Dictionary{{"devicetype", row.typeText}}));
+                  (Value::Dictionary{{"devicetype", typeText}}));
     }
     EXPECT_EQ(analytics->events().size(), 3u);
 
     // A missing warranty, a hidden offer or a missing serial number is refused.
     auto hidden = offer(30);
-    hidden["featureToggleParameters"] = Value(Value::Dictionary{{"hvOfferDisplay", false}});
+    hidden["featureToggleParameters"] = Value::Dictionary{{"hvOfferDisplay", false}};
     followUp.postFollowUpWithDeviceInfo(info("X", std::nullopt));
     followUp.postFollowUpWithDeviceInfo(info("Y", hidden));
     followUp.postFollowUpWithDeviceInfo(info(std::nullopt, std::nullopt));
@@ -173,7 +165,7 @@ TEST_F(QAXFollowUpTest, BadgeAndNotificationFollowTheServerDurations) {
 TEST_F(QAXFollowUpTest, SetUpAgainAccumulatesBitsAndKeepsANotification) {
     auto summary = offer(10);
     summary["featureToggleParameters"] =
-        Value(Value::Dictionary{{"hvOfferDisplay", true}, {"hvOfferSettingsRowBadge", true}});
+        Value::Dictionary{{"hvOfferDisplay", true}, {"hvOfferSettingsRowBadge", true}};
     summary["hvOfferBadgeBeforeEndDate"] = Value(14);
     summary["showNotificationToggle"] = Value(true);
     summary["showNotificationBeforeEndDate"] = Value(11);
@@ -221,7 +213,7 @@ TEST_F(QAXFollowUpTest, SetUpAgainAccumulatesBitsAndKeepsANotification) {
 
 TEST_F(QAXFollowUpTest, PostRuleDecidesEachDevice) {
     auto noDisplay = offer(30);
-    noDisplay["featureToggleParameters"] = Value(Value::Dictionary{{"hvOfferDisplay", false}});
+    noDisplay["featureToggleParameters"] = Value::Dictionary{{"hvOfferDisplay", false}};
     auto noEnd = offer(30);
     noEnd.erase("hvOfferEligibleUntil");
     auto displayNow = offer(30);
@@ -229,16 +221,10 @@ TEST_F(QAXFollowUpTest, PostRuleDecidesEachDevice) {
     auto displayTomorrow = offer(30);
     displayTomorrow["hvOfferFollowupDisplayDate"] = Value(epoch(1));
 
-    struct Row {
-        const char* serial;
-        std::optional<Value::Dictionary> summary;
-        std::optional<Date> activation;
-        bool due;
-        std::string message;
-    };
     const std::string notPosted = "Device eligible with future post date. Cannot post followup";
     // clang-format off
-    const std::vector<Row> rows = {
+    const std::tuple<const char*, std::optional<Value::Dictionary>, std::optional<Date>, bool,
+                     std::string> rows[] = {
         {"A", std::nullopt, {}, false, "No warranty downloaded for device. Don't post a followup"},
         {"B", noDisplay, {}, false, "Device NOT eligible. Don't post a followup"},
         {"C", noEnd, {}, false, "Device no longer eligible. Don't post a followup"},
@@ -249,17 +235,16 @@ TEST_F(QAXFollowUpTest, PostRuleDecidesEachDevice) {
         {"H", displayTomorrow, {}, false, notPosted},
     };
     // clang-format on
-    for (const Row& row : rows) {
-        SCOPED_TRACE(row.serial);
-        auto deviceInfo = info(row.serial, row.summary, QAXDeviceTypeDefault, row.activation);
-        EXPECT_EQ(followUp.postFollowUpWithDevicesInfo({deviceInfo}), row.due);
-        EXPECT_EQ(pending(row.serial).has_value(), row.due);
-        EXPECT_TRUE(
-            logged(std::string(kPostRule) + ": " + row.message + " for " +
-                   deviceInfo->device()->description() +
-                   (row.due || row.message.find("future") == std::string::npos
-                        ? ""
-                        : " on: " + (row.activation ? *row.activation : at(1)).description())));
+    for (const auto& [serial, summary, activation, due, message] : rows) {
+        SCOPED_TRACE(serial);
+        auto deviceInfo = info(serial, summary, QAXDeviceTypeDefault, activation);
+        EXPECT_EQ(followUp.postFollowUpWithDevicesInfo({deviceInfo}), due);
+        EXPECT_EQ(pending(serial).has_value(), due);
+        EXPECT_TRUE(logged(std::string(kPostRule) + ": " + message + " for " +
+                           deviceInfo->device()->description() +
+                           (due || message.find("future") == std::string::npos
+                                ? ""
+                                : " on: " + (activation ? *activation : at(1)).description())));
     }
     EXPECT_EQ(tp.log->count(std::string(kPostRule) +
                             ": Using initial postdate as it is later than FollowupDisplay Date"),
@@ -295,19 +280,16 @@ TEST_F(QAXFollowUpTest, DismissalKeepsTheOfferAwayUntilANewOfferPeriod) {
                        device->device()->description() + ", leaving unposted"));
 
     // Conversion: dismissal date against the current display date.
-    struct Row {
-        double displayDaysFromDismissal;
-        bool converts;
-    };
     tp.clock->advanceBy(5 * kDay);
     const Date dismissedAt = at(-5);
-    for (const Row row : {Row{0, false}, Row{-1, false}, Row{1, true}}) {
-        SCOPED_TRACE(row.displayDaysFromDismissal);
+    const std::pair<double, bool> rows[] = {{0, false}, {-1, false}, {1, true}};
+    for (const auto& [displayDaysFromDismissal, converts] : rows) {
+        SCOPED_TRACE(displayDaysFromDismissal);
         summary["hvOfferFollowupDisplayDate"] = Value(static_cast<std::int64_t>(
-            dismissedAt.secondsSince1970() + row.displayDaysFromDismissal * kDay));
+            dismissedAt.secondsSince1970() + displayDaysFromDismissal * kDay));
         auto converted = info("SN", summary);
-        EXPECT_EQ(followUp.postFollowUpWithDevicesInfo({converted}), row.converts);
-        EXPECT_EQ(pending("SN").has_value(), row.converts);
+        EXPECT_EQ(followUp.postFollowUpWithDevicesInfo({converted}), converts);
+        EXPECT_EQ(pending("SN").has_value(), converts);
     }
     EXPECT_TRUE(logged("Device not eligible for conversion. " + device->device()->description() +
                        ", followup dismissed date: " + dismissedAt.description() +
@@ -330,7 +312,7 @@ TEST_F(QAXFollowUpTest, DismissalKeepsTheOfferAwayUntilANewOfferPeriod) {
 
 TEST_F(QAXFollowUpTest, RefreshUpdatesClearsAndReposts) {
     auto noDisplay = offer(30);
-    noDisplay["featureToggleParameters"] = Value(Value::Dictionary{{"hvOfferDisplay", false}});
+    noDisplay["featureToggleParameters"] = Value::Dictionary{{"hvOfferDisplay", false}};
     center->setItems(kClient, {pendingItemFor("A"), pendingItemFor("B"), pendingItemFor("C"),
                                pendingItemFor("D")});
     auto a = info("A", offer(30));
@@ -356,7 +338,7 @@ TEST_F(QAXFollowUpTest, RefreshUpdatesClearsAndReposts) {
     // A single-device refresh leaves other items alone; forced posting brings a dismissed
     // device back despite the dismissed array.
     center->setItems(kClient, {pendingItemFor("B")});
-    prefs.setObject("FollowupDismissedSerialNumberHashes", Value(Value::Array{sha256Hash("F")}));
+    prefs.setObject("FollowupDismissedSerialNumberHashes", Value::Array{sha256Hash("F")});
     result = followUp.refreshFollowupWithDeviceInfo(infos[4], true);
     EXPECT_EQ(result, QAXDeviceInfoList{infos[4]});
     EXPECT_TRUE(pending("F") && pending("B"));
@@ -377,10 +359,8 @@ TEST_F(QAXFollowUpTest, NotificationDismissalStripsEveryMatchingItem) {
     // Through the follow-up service itself, whatever provider the object was given.
     auto other = std::make_shared<test::InMemoryFollowUpCenter>();
     QAXFollowUp elsewhere(tp.platform, std::make_shared<QAXDefaultFolllowUpProvider>(other));
-    FollowUpItem a = pendingItemFor("A");
-    a.notification = FollowUpNotification{};
-    FollowUpItem b = pendingItemFor("B");
-    b.notification = FollowUpNotification{};
+    FollowUpItem a = pendingItemFor("A"), b = pendingItemFor("B");
+    a.notification = b.notification = FollowUpNotification{};
     center->setItems(kClient, {a, b, a});
 
     elsewhere.dismissNotificationForSerialNumber("A");
@@ -397,19 +377,13 @@ TEST_F(QAXFollowUpTest, NotificationDismissalStripsEveryMatchingItem) {
 }
 
 TEST_F(QAXFollowUpTest, LegacyItemIsMigratedOrCleared) {
-    struct Row {
-        const char* name;
-        std::vector<std::string> pendingIds;  // "" stands for the legacy identifier
-        bool warranty;
-        const char* postError;
-        const char* clearError;
-        std::vector<std::string> after;
-        std::string message;
-    };
     const std::string device = QAXFollowUp::uniqueIdentfierForSerialNumber("SN");
     const std::string other = QAXFollowUp::uniqueIdentfierForSerialNumber("OTHER");
     // clang-format off
-    const std::vector<Row> rows = {
+    // The pending identifiers ("" stands for the legacy one), a warranty, failures of the post
+    // and the clear, the identifiers after, and the message logged.
+    const std::tuple<const char*, std::vector<std::string>, bool, const char*, const char*,
+                     std::vector<std::string>, std::string> rows[] = {
         {"migrated", {""}, true, nullptr, nullptr, {device}, "Migrating legacy followup.."},
         {"no warranty", {""}, false, nullptr, nullptr, {},
          "Clearing legacy followup, no legacy warranty was found.."},
@@ -420,26 +394,26 @@ TEST_F(QAXFollowUpTest, LegacyItemIsMigratedOrCleared) {
         {"not legacy", {other}, true, nullptr, nullptr, {other}, ""},
     };
     // clang-format on
-    for (const Row& row : rows) {
-        SCOPED_TRACE(row.name);
+    for (const auto& [name, pendingIds, warranty, postError, clearError, left, message] : rows) {
+        SCOPED_TRACE(name);
         tp.log->clear();
         std::vector<FollowUpItem> seeded;
-        for (const auto& id : row.pendingIds) {
+        for (const auto& id : pendingIds) {
             seeded.push_back(pendingItemFor("SN", id.empty() ? std::string(kClient) : id));
         }
         center->setItems(kClient, seeded);
-        center->failPost(row.postError ? std::optional<std::string>(row.postError) : std::nullopt);
-        center->failClear(row.clearError ? std::optional<std::string>(row.clearError)
-                                         : std::nullopt);
+        auto error = [](const char* e) { return e ? std::optional<std::string>(e) : std::nullopt; };
+        center->failPost(error(postError));
+        center->failClear(error(clearError));
         followUp.migrateLegacyFollowUpIfNeededWithDeviceInfo(
-            info("SN", row.warranty ? std::optional(offer(30)) : std::nullopt));
+            info("SN", warranty ? std::optional(offer(30)) : std::nullopt));
         std::vector<std::string> after;
         for (const auto& item : center->items(kClient)) {
             after.push_back(*item.uniqueIdentifier);
         }
-        EXPECT_EQ(after, row.after);
-        if (!row.message.empty()) {
-            EXPECT_TRUE(logged(row.message));
+        EXPECT_EQ(after, left);
+        if (!message.empty()) {
+            EXPECT_TRUE(logged(message));
         } else {
             EXPECT_TRUE(tp.log->messages().empty());
         }

@@ -29,10 +29,10 @@ inline std::string payload(std::int64_t generation) {
 
 // The coverage summary cached for the trial's serial number.
 inline Value summary(std::int64_t generation) {
-    return Value(Value::Dictionary{{"covered", Value(true)},
-                                   {"hvOfferIdentifier", Value("G" + std::to_string(generation))},
-                                   {"coverageLocalizedDesc", Value(payload(generation))},
-                                   {kGenerationKey, Value(generation)}});
+    return Value::Dictionary{{"covered", Value(true)},
+                             {"hvOfferIdentifier", Value("G" + std::to_string(generation))},
+                             {"coverageLocalizedDesc", Value(payload(generation))},
+                             {kGenerationKey, Value(generation)}};
 }
 
 }  // namespace qax::test::crashtrial

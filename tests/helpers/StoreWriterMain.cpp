@@ -74,8 +74,8 @@ class Stores {
     bool writePreferences(std::int64_t g) {
         return platform_->preferences->setObject(
             trial::kPreferenceKey,
-            Value(Value::Dictionary{{trial::kGenerationKey, Value(g)},
-                                    {trial::kPayloadKey, Value(trial::payload(g))}}));
+            Value::Dictionary{{trial::kGenerationKey, Value(g)},
+                              {trial::kPayloadKey, Value(trial::payload(g))}});
     }
 
     // As a download leaves it: the file, then the keys that make the agent trust it.

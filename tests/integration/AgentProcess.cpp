@@ -20,10 +20,11 @@ void AgentProcess::writeRootFile(const std::string& relativePath, const Value& p
 }
 
 void AgentProcess::writeDevices(const std::string& serialNumber,
-                                const std::optional<std::string>& watchSerialNumber) {
+                                const std::optional<std::string>& watchSerialNumber,
+                                const std::string& systemVersion) {
     writeRootFile("device.plist", Value::Dictionary{{"SerialNumber", serialNumber},
                                                     {"ProductType", "Phone1,1"},
-                                                    {"ProductVersion", "1.0"}});
+                                                    {"ProductVersion", systemVersion}});
     if (!watchSerialNumber) {
         return;
     }
@@ -37,18 +38,28 @@ void AgentProcess::writeDevices(const std::string& serialNumber,
                   Value::Dictionary{{"Kestova", Value::Dictionary{{"Tessel_3_0", true}}}});
 }
 
+void AgentProcess::writeAccounts(const std::optional<std::string>& tokenServiceURL,
+                                 const Value::Dictionary& tokens) {
+    Value::Dictionary accounts{{"PrimaryCloudAccount", Value::Dictionary{{"altDSID", "primary"}}}};
+    if (tokenServiceURL) {
+        accounts["KFAccount"] = Value::Dictionary{
+            {"altDSID", "kf"}, {"TokenServiceURL", *tokenServiceURL}, {"Tokens", tokens}};
+        accounts["StoreAccount"] = Value::Dictionary{{"storefront", "143441-1,29"}};
+    }
+    writeRootFile("accounts.plist", accounts);
+}
+
 void AgentProcess::registerApplication(const std::string& name, const std::string& executablePath,
                                        std::optional<std::string> bundleIdentifier,
                                        std::optional<Value> entitlement) {
     Value::Dictionary app{{"ExecutablePath", Value(executablePath)},
                           {"Installed", Value(true)},
-                          {"Entitlements", Value(Value::Dictionary{})}};
+                          {"Entitlements", Value::Dictionary{}}};
     if (bundleIdentifier) {
         app["BundleIdentifier"] = *bundleIdentifier;
     }
     if (entitlement) {
-        app["Entitlements"] =
-            Value(Value::Dictionary{{"com.velmora.private.qaxagent", *entitlement}});
+        app["Entitlements"] = Value::Dictionary{{"com.velmora.private.qaxagent", *entitlement}};
     }
     writeRootFile("apps/" + name + ".plist", Value(std::move(app)));
 }

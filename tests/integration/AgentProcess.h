@@ -16,6 +16,16 @@
 
 namespace qax::test {
 
+struct ToolResult {
+    int status = -1;  // the exit status; -1 when killed by a signal or at the deadline
+    std::string out;
+    std::string err;
+};
+
+// Runs a program with `environment`, waiting at most `seconds`.
+ToolResult runTool(const std::string& program, const std::vector<std::string>& args,
+                   const std::vector<std::string>& environment, double seconds = 30);
+
 class AgentProcess {
   public:
     AgentProcess();
@@ -29,10 +39,15 @@ class AgentProcess {
 
     // Writes a file under the platform root ("device.plist", "apps/x.plist").
     void writeRootFile(const std::string& relativePath, const Value& plist);
-    // This device (a phone with `serialNumber`) and, when given, one paired watch, with the
-    // paired-watches feature on.
+    // This device (a phone with `serialNumber` on `systemVersion`) and, when given, one paired
+    // watch, with the paired-watches feature on.
     void writeDevices(const std::string& serialNumber,
-                      const std::optional<std::string>& watchSerialNumber = std::nullopt);
+                      const std::optional<std::string>& watchSerialNumber = std::nullopt,
+                      const std::string& systemVersion = "1.0");
+    // A signed-in user; with a token service, also a KF account (with `tokens`, service ->
+    // token) renewed there and a store account.
+    void writeAccounts(const std::optional<std::string>& tokenServiceURL = std::nullopt,
+                       const Value::Dictionary& tokens = {});
     // Registers an executable in the application registry under `name`; an entitlement value of
     // none leaves the entitlement out.
     void registerApplication(const std::string& name, const std::string& executablePath,
@@ -53,6 +68,13 @@ class AgentProcess {
     // Polls the log until `text` has appeared `times` times.
     bool waitForLog(const std::string& text, int times = 1, double seconds = 5) const;
 
+#ifdef QAX_CTL_BINARY
+    // Runs qaxctl with this environment (in the builds that name qaxctl).
+    ToolResult ctl(const std::vector<std::string>& args) const {
+        return runTool(QAX_CTL_BINARY, args, environment());
+    }
+#endif
+
     // The environment the agent runs with (HOME, QAX_PLATFORM_ROOT, QAX_RUNTIME_DIR, PATH, and
     // the extra entries).
     std::vector<std::string> environment() const;
@@ -63,16 +85,6 @@ class AgentProcess {
     TempDir dir_;
     std::unique_ptr<SpawnedProcess> process_;
 };
-
-struct ToolResult {
-    int status = -1;  // the exit status; -1 when killed by a signal or at the deadline
-    std::string out;
-    std::string err;
-};
-
-// Runs a program with `environment`, waiting at most `seconds`.
-ToolResult runTool(const std::string& program, const std::vector<std::string>& args,
-                   const std::vector<std::string>& environment, double seconds = 30);
 
 // The real path of the running test executable.
 std::string selfExecutable();

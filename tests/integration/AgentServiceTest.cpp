@@ -27,11 +27,10 @@ constexpr const char* kRejected =
 class AgentServiceTest : public ::testing::Test {
   protected:
     void SetUp() override {
-        agent.writeRootFile("device.plist",
-                            Value(Value::Dictionary{{"SerialNumber", Value("ITEST-SN-1")},
-                                                    {"ProductType", Value("Phone1,1")},
-                                                    {"ProductVersion", Value("1.0")},
-                                                    {"InternalBuild", Value(true)}}));
+        agent.writeRootFile("device.plist", Value::Dictionary{{"SerialNumber", Value("ITEST-SN-1")},
+                                                              {"ProductType", Value("Phone1,1")},
+                                                              {"ProductVersion", Value("1.0")},
+                                                              {"InternalBuild", Value(true)}});
         // This test process is the entitled client; it is registered outside any bundle.
         entitle(Value(true));
         ASSERT_TRUE(agent.start()) << agent.log();
@@ -56,14 +55,10 @@ class AgentServiceTest : public ::testing::Test {
         return device ? device->serialNumber() : std::nullopt;
     }
 
-    test::ToolResult ctl(const std::vector<std::string>& args) {
-        return test::runTool(QAX_CTL_BINARY, args, agent.environment());
-    }
-
     test::AgentProcess agent;
 };
 
-TEST_F(AgentServiceTest, EntitledClientsAreServedAndOthersClosed) {
+TEST_F(AgentServiceTest, EntitledClientsAreServedOthersClosedAndBrokenSendersAlone) {
     auto client = connect();
     std::string error;
     auto reply = client->call("defaultDevice:", {}, kWait, &error);
@@ -115,7 +110,7 @@ TEST_F(AgentServiceTest, EntitledClientsAreServedAndOthersClosed) {
         EXPECT_TRUE(agent.waitForLog(kRejected, ++rejections)) << what << "\n" << agent.log();
     }
     // A program the registry does not know at all.
-    auto unknown = ctl({"store-check", "com.velmora.support"});
+    auto unknown = agent.ctl({"store-check", "com.velmora.support"});
     EXPECT_EQ(unknown.status, 69);
     EXPECT_NE(unknown.err.find("the agent closed the connection"), std::string::npos)
         << unknown.err;
@@ -123,9 +118,8 @@ TEST_F(AgentServiceTest, EntitledClientsAreServedAndOthersClosed) {
     entitle(Value(1));
     EXPECT_EQ(defaultSerial(*connect()), "ITEST-SN-1");
     EXPECT_EQ(defaultSerial(*client), "ITEST-SN-1") << "the first client is still served";
-}
 
-TEST_F(AgentServiceTest, BrokenFramesAndBadRequestsHarmOnlyTheirSender) {
+    // Broken frames and bad requests harm only their sender.
     auto bytes = [](std::initializer_list<unsigned char> b) {
         return std::string(b.begin(), b.end());
     };
@@ -140,14 +134,12 @@ TEST_F(AgentServiceTest, BrokenFramesAndBadRequestsHarmOnlyTheirSender) {
         {"over 4 MiB", bytes({0, 0x40, 0, 1})},
         {"nested 200 deep", *IpcFrameCodec::frame(deep)},
         {"request without an id",
-         *IpcFrameCodec::encode(Value(Value::Dictionary{{"op", Value("defaultDevice:")}}))},
-        {"not a dictionary", *IpcFrameCodec::encode(Value(Value::Array{Value(1)}))},
+         *IpcFrameCodec::encode(Value::Dictionary{{"op", Value("defaultDevice:")}})},
+        {"not a dictionary", *IpcFrameCodec::encode(Value::Array{Value(1)})},
     };
-    auto client = connect();
     int closures = 0;
     for (const auto& [what, frame] : broken) {
         auto bad = connect();
-        std::string error;
         ASSERT_TRUE(bad->sendRaw(frame, &error)) << what << ": " << error;
         EXPECT_TRUE(bad->waitForClose(kWait)) << what;
         EXPECT_TRUE(agent.waitForLog("Closing connection from pid", ++closures)) << what;
@@ -164,24 +156,23 @@ TEST_F(AgentServiceTest, BrokenFramesAndBadRequestsHarmOnlyTheirSender) {
     };
     for (const auto& [op, args, text] : errors) {
         std::string transport;
-        auto reply = client->call(op, args, kWait, &transport);
-        ASSERT_TRUE(reply && reply->error) << op << ": " << transport;
-        EXPECT_EQ(reply->error->rfind(text, 0), 0u) << *reply->error;
+        auto answer = client->call(op, args, kWait, &transport);
+        ASSERT_TRUE(answer && answer->error) << op << ": " << transport;
+        EXPECT_EQ(answer->error->rfind(text, 0), 0u) << *answer->error;
     }
 
     // Far more requests at once than the agent keeps in flight, one of them in XML: each is
     // answered once.
     constexpr int kRequests = 300;
-    std::string all = *IpcFrameCodec::frame(*toXmlPlist(Value(Value::Dictionary{
-        {"id", Value(kRequests)}, {"op", Value("defaultDevice:")}, {"args", Value::Array{}}})));
+    std::string frames = *IpcFrameCodec::frame(*toXmlPlist(Value::Dictionary{
+        {"id", Value(kRequests)}, {"op", Value("defaultDevice:")}, {"args", Value::Array{}}}));
     for (int id = 1; id < kRequests; ++id) {
-        all += *IpcFrameCodec::encode(
-            Value(Value::Dictionary{{"id", Value(id)},
-                                    {"op", Value(id % 2 ? "defaultDevice:" : "pairedDevices:")},
-                                    {"args", Value(Value::Array{})}}));
+        frames += *IpcFrameCodec::encode(
+            Value::Dictionary{{"id", Value(id)},
+                              {"op", Value(id % 2 ? "defaultDevice:" : "pairedDevices:")},
+                              {"args", Value(Value::Array{})}});
     }
-    std::string error;
-    ASSERT_TRUE(client->sendRaw(all, &error)) << error;
+    ASSERT_TRUE(client->sendRaw(frames, &error)) << error;
     std::set<std::int64_t> ids;
     for (int i = 0; i < kRequests; ++i) {
         auto message = client->receive(kWait, &error);
@@ -204,37 +195,36 @@ TEST_F(AgentServiceTest, QaxctlLaunchEventsASecondAgentAndACleanStop) {
     Value::Dictionary archived = watch;
     archived["serialNumber"] = "W0";
     archived["isArchived"] = true;
-    agent.writeRootFile("paired-devices.plist", Value(Value::Array{Value(watch), Value(archived)}));
-    agent.writeRootFile("features.plist",
-                        Value(Value::Dictionary{
-                            {"Kestova", Value(Value::Dictionary{{"Tessel_3_0", Value(true)}})}}));
+    agent.writeRootFile("paired-devices.plist", Value::Array{Value(watch), Value(archived)});
+    agent.writeRootFile(
+        "features.plist",
+        Value::Dictionary{{"Kestova", Value(Value::Dictionary{{"Tessel_3_0", Value(true)}})}});
     FilePreferenceStore(FilePreferenceStore::domainPath(agent.home()))
-        .setObject("ServerVersionOverride",
-                   Value(Value::Dictionary{{"LowServerVersion", Value(2)},
-                                           {"HighServerVersion", Value(3)}}));
+        .setObject("ServerVersionOverride", Value::Dictionary{{"LowServerVersion", Value(2)},
+                                                              {"HighServerVersion", Value(3)}});
 
-    auto device = ctl({"default-device", "--json"});
+    auto device = agent.ctl({"default-device", "--json"});
     ASSERT_EQ(device.status, 0) << device.err;
     auto json = parseJson(device.out);
     ASSERT_TRUE(json) << device.out;
     EXPECT_EQ(*json->find("serialNumber"), Value("ITEST-SN-1"));
     EXPECT_EQ(*json->find("deviceTypeString"), Value("Default"));
     EXPECT_TRUE(agent.waitForLog("with calling process: com.velmora.Preferences"));
-    auto paired = ctl({"paired-devices", "--json"});
+    auto paired = agent.ctl({"paired-devices", "--json"});
     ASSERT_EQ(paired.status, 0) << paired.err;
     auto list = parseJson(paired.out);
     ASSERT_TRUE(list && list->isArray() && list->size() == 1) << paired.out;
     EXPECT_EQ(*(*list->asArray())[0].find("serialNumber"), Value("W1"));
     EXPECT_EQ(*(*list->asArray())[0].find("name"), Value("Morning"));
-    EXPECT_NE(ctl({"paired-devices"}).out.find("Morning  W1"), std::string::npos);
+    EXPECT_NE(agent.ctl({"paired-devices"}).out.find("Morning  W1"), std::string::npos);
 
     // An internal build reads the web URL override.
-    auto plain = ctl({"web-url-override"});
+    auto plain = agent.ctl({"web-url-override"});
     EXPECT_EQ(plain.status, 0) << plain.err;
     EXPECT_EQ(plain.out, "no web URL override\n");
     FilePreferenceStore(FilePreferenceStore::domainPath(agent.home()))
         .setObject("WebFlowURL", Value("https://flow.example/x"));
-    auto stored = ctl({"web-url-override", "--json"});
+    auto stored = agent.ctl({"web-url-override", "--json"});
     EXPECT_EQ(stored.status, 0) << stored.err;
     EXPECT_EQ(stored.out, "\"https://flow.example/x\"\n");
 
@@ -242,7 +232,7 @@ TEST_F(AgentServiceTest, QaxctlLaunchEventsASecondAgentAndACleanStop) {
                                              "com.velmora.pairlink.devicedidunpair"));
     EXPECT_TRUE(agent.waitForLog(
         "got launched with notificationName: com.velmora.pairlink.devicedidunpair"));
-    auto notified = ctl({"notify", "com.velmora.pairlink.devicedidpair"});
+    auto notified = agent.ctl({"notify", "com.velmora.pairlink.devicedidpair"});
     EXPECT_EQ(notified.status, 0) << notified.err;
     EXPECT_TRUE(
         agent.waitForLog("got launched with notificationName: com.velmora.pairlink.devicedidpair"));

@@ -4,10 +4,12 @@
 
 #include <chrono>
 #include <filesystem>
+#include <future>
 #include <thread>
 
 #include "core/AtomicFile.h"
 #include "core/JsonCodec.h"
+#include "platform/host/CurlHttpClient.h"
 
 namespace qax::test {
 
@@ -42,6 +44,23 @@ CoverageSimProcess::CoverageSimProcess(const std::string& state, const std::stri
         }
         std::this_thread::sleep_for(std::chrono::milliseconds(5));
     }
+}
+
+HttpResult CoverageSimProcess::send(const HttpRequest& request) const {
+    CurlHttpClient::Options options;
+    options.extraCAFile = caFile();
+    CurlHttpClient http(options);
+    std::promise<HttpResult> done;
+    http.send(request, [&](HttpResult r) { done.set_value(std::move(r)); });
+    return done.get_future().get();
+}
+
+HttpResult CoverageSimProcess::call(const std::string& method, const std::string& path,
+                                    std::optional<std::string> body) const {
+    HttpRequest request(base_ + path, 20);
+    request.setMethod(method);
+    request.setBody(std::move(body));
+    return send(request);
 }
 
 std::vector<Value> CoverageSimProcess::requestLog() const {

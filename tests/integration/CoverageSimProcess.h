@@ -9,6 +9,7 @@
 
 #include "SpawnedProcess.h"
 #include "core/Value.h"
+#include "platform/HttpClient.h"
 
 namespace qax::test {
 
@@ -24,6 +25,11 @@ class CoverageSimProcess {
     const std::string& base() const { return base_; }
     // The CA that issued the simulator's certificate.
     std::string caFile() const { return state_ + "/ca.pem"; }
+    // Sends `request` over a session of its own that trusts the simulator; the answer.
+    HttpResult send(const HttpRequest& request) const;
+    // `method` on `path` (after base()), with a body when one is given.
+    HttpResult call(const std::string& method, const std::string& path,
+                    std::optional<std::string> body = std::nullopt) const;
     // The lines of requests.jsonl, parsed.
     std::vector<Value> requestLog() const;
 

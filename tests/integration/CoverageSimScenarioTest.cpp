@@ -15,7 +15,6 @@
 #include "fakes/TestPlatform.h"
 #include "platform/PurchaseHistory.h"
 #include "platform/StoreLookup.h"
-#include "platform/host/CurlHttpClient.h"
 #include "platform/host/HostPlatform.h"
 
 namespace qax::test {
@@ -23,29 +22,15 @@ namespace {
 
 using SteadyClock = std::chrono::steady_clock;
 
-HttpResult send(HttpClient& http, const HttpRequest& request) {
-    std::promise<HttpResult> done;
-    http.send(request, [&](HttpResult r) { done.set_value(std::move(r)); });
-    return done.get_future().get();
-}
-
 HttpRequest summaryRequest(const std::string& base, const std::string& serial,
                            double timeout = 20) {
     HttpRequest request(base + "/api/v3/coverage/summary", timeout);
     request.setMethod("POST");
     request.setValue("X-Velmora-KF-Token", std::string("token"));
-    request.setBody(toJsonString(Value(Value::Dictionary{{"serialNumber", Value(serial)},
-                                                         {"locale", Value("en_US")},
-                                                         {"requestTimestamp", Value(1)},
-                                                         {"requestTimezone", Value("UTC")}})));
-    return request;
-}
-
-HttpRequest adminRequest(const std::string& url, const std::string& method,
-                         std::optional<std::string> body = std::nullopt) {
-    HttpRequest request(url, 20);
-    request.setMethod(method);
-    request.setBody(std::move(body));
+    request.setBody(toJsonString(Value::Dictionary{{"serialNumber", Value(serial)},
+                                                   {"locale", Value("en_US")},
+                                                   {"requestTimestamp", Value(1)},
+                                                   {"requestTimezone", Value("UTC")}}));
     return request;
 }
 
@@ -56,11 +41,6 @@ double nowSeconds() {
 
 class CoverageSimScenarioTest : public ::testing::Test {
   protected:
-    std::shared_ptr<CurlHttpClient> clientFor(const CoverageSimProcess& sim) {
-        CurlHttpClient::Options options;
-        options.extraCAFile = sim.caFile();
-        return std::make_shared<CurlHttpClient>(options);
-    }
     std::string state() const { return (dir.path() / "sim").string(); }
     std::string root() const { return (dir.path() / "root").string(); }
 
@@ -70,24 +50,23 @@ class CoverageSimScenarioTest : public ::testing::Test {
 TEST_F(CoverageSimScenarioTest, AnswersFollowTheScenarioThenTheService) {
     CoverageSimProcess sim(state(), root(), {"--answer", "SN-A=401", "--answer", "*=500"});
     ASSERT_FALSE(sim.base().empty()) << "coverage-sim did not start";
-    auto http = clientFor(sim);
 
     // The lists given at start: a serial number's own, then "*" for any other.
-    EXPECT_EQ(send(*http, summaryRequest(sim.base(), "SN-A")).response->statusCode, 401);
-    EXPECT_EQ(send(*http, summaryRequest(sim.base(), "SN-B")).response->statusCode, 500);
-    EXPECT_EQ(send(*http, summaryRequest(sim.base(), "SN-B")).response->statusCode, 200);
+    EXPECT_EQ(sim.send(summaryRequest(sim.base(), "SN-A")).response->statusCode, 401);
+    EXPECT_EQ(sim.send(summaryRequest(sim.base(), "SN-B")).response->statusCode, 500);
+    EXPECT_EQ(sim.send(summaryRequest(sim.base(), "SN-B")).response->statusCode, 200);
 
-    const std::string scenarioURL = sim.base() + "/admin/scenario";
-    auto set = send(*http, adminRequest(scenarioURL, "POST", R"({
+    const std::string scenario = "/admin/scenario";
+    auto set = sim.call("POST", scenario, R"({
         "SN-A": ["garbage", "html", "array", "deep 1000", "huge 40000000", "reset", "reset 2000", "hang",
                  "delay 300 503", "OK"],
-        "@lookup": 404})"));
+        "@lookup": 404})");
     ASSERT_TRUE(set.response);
     EXPECT_EQ(set.response->statusCode, 200) << set.response->body;
-    auto refused = send(*http, adminRequest(scenarioURL, "POST", R"({"SN-A": ["sometimes"]})"));
+    auto refused = sim.call("POST", scenario, R"({"SN-A": ["sometimes"]})");
     EXPECT_EQ(refused.response->statusCode, 400);
     EXPECT_NE(refused.response->body.find("sometimes"), std::string::npos);
-    auto shown = send(*http, adminRequest(scenarioURL, "GET"));
+    auto shown = sim.call("GET", scenario);
     EXPECT_EQ(parseJson(shown.response->body), parseJson(set.response->body))
         << "a refused scenario changes nothing";
 
@@ -104,7 +83,7 @@ TEST_F(CoverageSimScenarioTest, AnswersFollowTheScenarioThenTheService) {
     for (const auto& [step, timeout, status, kind] : rows) {
         SCOPED_TRACE(step);
         const auto started = SteadyClock::now();
-        auto result = send(*http, summaryRequest(sim.base(), "SN-A", timeout));
+        auto result = sim.send(summaryRequest(sim.base(), "SN-A", timeout));
         const double took = std::chrono::duration<double>(SteadyClock::now() - started).count();
         ASSERT_EQ(result.response.has_value(), status != 0) << result.error;
         if (!result.response) {
@@ -117,16 +96,12 @@ TEST_F(CoverageSimScenarioTest, AnswersFollowTheScenarioThenTheService) {
         EXPECT_TRUE(kind != NotJson || !body || body->find("error")) << result.response->body;
         EXPECT_TRUE(status != 503 || took >= 0.3) << took;
     }
-    EXPECT_EQ(send(*http, adminRequest(sim.base() + "/store/lookup?bundleId=x", "GET"))
-                  .response->statusCode,
-              404);
-    EXPECT_EQ(parseJson(send(*http, adminRequest(scenarioURL, "GET")).response->body),
-              Value(Value::Dictionary{}))
+    EXPECT_EQ(sim.call("GET", "/store/lookup?bundleId=x").response->statusCode, 404);
+    EXPECT_EQ(parseJson(sim.call("GET", scenario).response->body), Value::Dictionary{})
         << "every list used up";
 
     // The log shows which answer each request got; the admin endpoints stay out of it.
-    auto log = parseJson(
-        send(*http, adminRequest(sim.base() + "/admin/requests?since=3", "GET")).response->body);
+    auto log = parseJson(sim.call("GET", "/admin/requests?since=3").response->body);
     ASSERT_TRUE(log && log->isArray());
     std::multiset<std::string> played;
     for (const auto& entry : *log->asArray()) {
@@ -142,7 +117,6 @@ TEST_F(CoverageSimScenarioTest, AnswersFollowTheScenarioThenTheService) {
                                                   "huge 40000000", "reset", "reset 2000", "hang",
                                                   "delay 300 503", "ok", "404"}));
     EXPECT_EQ(sim.requestLog().size(), log->size() + 3);
-    http.reset();
 }
 
 TEST_F(CoverageSimScenarioTest, StoreEndpointsServeTheHostBindings) {
@@ -187,7 +161,7 @@ TEST_F(CoverageSimScenarioTest, StoreEndpointsServeTheHostBindings) {
     EXPECT_FALSE(unknown.second);
     EXPECT_TRUE(unknown.first.empty());
     EXPECT_EQ(*sim.requestLog().back().find("query"),
-              Value(Value::Dictionary{{"bundleId", Value("a&b=c d")}}));
+              (Value::Dictionary{{"bundleId", Value("a&b=c d")}}));
 
     auto [bought, boughtError] = purchases(42, {"com.velmora.support"});
     ASSERT_FALSE(boughtError) << *boughtError;
@@ -196,11 +170,9 @@ TEST_F(CoverageSimScenarioTest, StoreEndpointsServeTheHostBindings) {
     EXPECT_EQ(bought[0].productURL, "https://p/1");
     EXPECT_TRUE(purchases(7, {"com.velmora.support"}).first.empty());
 
-    std::promise<HttpResult> posted;
-    platform->http->send(
-        adminRequest(sim.base() + "/admin/scenario", "POST", R"({"@purchases": ["500"]})"),
-        [&](HttpResult r) { posted.set_value(std::move(r)); });
-    ASSERT_EQ(posted.get_future().get().response->statusCode, 200);
+    ASSERT_EQ(
+        sim.call("POST", "/admin/scenario", R"({"@purchases": ["500"]})").response->statusCode,
+        200);
     auto failed = purchases(42, {"com.velmora.support"});
     ASSERT_TRUE(failed.second);
     EXPECT_NE(failed.second->find("HTTP 500"), std::string::npos) << *failed.second;
@@ -220,22 +192,20 @@ TEST_F(CoverageSimScenarioTest, StoreEndpointsServeTheHostBindings) {
 
 TEST_F(CoverageSimScenarioTest, RelativeDatesFollowTheClock) {
     const std::string clockFile = root() + "/state/clock.plist";
-    writeFile(clockFile, *toXmlPlist(Value(Value::Dictionary{{"OffsetSeconds", Value(864000)}})));
+    writeFile(clockFile, *toXmlPlist(Value::Dictionary{{"OffsetSeconds", Value(864000)}}));
     CoverageSimProcess sim(state(), root(), {"--clock-offset", "86400"}, {"QAX_CLOCK=simulated"});
     ASSERT_FALSE(sim.base().empty()) << "coverage-sim did not start";
-    auto http = clientFor(sim);
     auto eligibleUntil = [&] {
-        auto result = send(*http, summaryRequest(sim.base(), "SN-C"));
+        auto result = sim.send(summaryRequest(sim.base(), "SN-C"));
         auto body = result.response ? parseJson(result.response->body) : std::nullopt;
         const Value* until = body ? body->find("hvOfferEligibleUntil") : nullptr;
         return until && until->asInteger() ? *until->asInteger() / 1000.0 : 0.0;
     };
     // The built-in summary's offer ends 30 days after "now".
     EXPECT_NEAR(eligibleUntil(), nowSeconds() + 86400 + 864000 + 30 * 86400, 60);
-    writeFile(clockFile, *toXmlPlist(Value(Value::Dictionary{{"OffsetSeconds", Value(-3600.5)}})));
+    writeFile(clockFile, *toXmlPlist(Value::Dictionary{{"OffsetSeconds", Value(-3600.5)}}));
     EXPECT_NEAR(eligibleUntil(), nowSeconds() + 86400 - 3600.5 + 30 * 86400, 60)
         << "the clock file is read on each request";
-    http.reset();
 }
 
 }  // namespace

@@ -48,51 +48,41 @@ void preferMemoryForTemporaryFiles() {
     }
 }
 
-// A running writer with its stdout (and, when asked, stderr) on pipes.
+// A running writer with its stdout and stderr on pipes.
 class Writer {
   public:
-    Writer(std::vector<std::string> args, bool captureErrors,
-           std::vector<std::string> environment = {}) {
-        int out[2], err[2] = {-1, -1};
+    explicit Writer(std::vector<std::string> args, std::vector<std::string> environment = {}) {
+        int out[2], err[2];
         EXPECT_EQ(::pipe2(out, O_CLOEXEC), 0);
+        EXPECT_EQ(::pipe2(err, O_CLOEXEC), 0);
         posix_spawn_file_actions_t actions;
         posix_spawn_file_actions_init(&actions);
         posix_spawn_file_actions_addopen(&actions, 0, "/dev/null", O_RDONLY, 0);
         posix_spawn_file_actions_adddup2(&actions, out[1], 1);
-        if (captureErrors) {
-            EXPECT_EQ(::pipe2(err, O_CLOEXEC), 0);
-            posix_spawn_file_actions_adddup2(&actions, err[1], 2);
-        } else {
-            posix_spawn_file_actions_addopen(&actions, 2, "/dev/null", O_WRONLY, 0);
-        }
+        posix_spawn_file_actions_adddup2(&actions, err[1], 2);
         args.insert(args.begin(), QAX_STORE_WRITER_BINARY);
-        std::vector<char*> argv;
+        std::vector<char*> argv, envp;
         for (auto& a : args) {
             argv.push_back(a.data());
         }
-        argv.push_back(nullptr);
-        std::vector<char*> envp;
         for (auto& e : environment) {
             envp.push_back(e.data());
         }
+        argv.push_back(nullptr);
         envp.push_back(nullptr);
         EXPECT_EQ(posix_spawn(&pid_, argv[0], &actions, nullptr, argv.data(),
                               environment.empty() ? environ : envp.data()),
                   0);
         posix_spawn_file_actions_destroy(&actions);
         ::close(out[1]);
+        ::close(err[1]);
         out_ = out[0];
-        if (captureErrors) {
-            ::close(err[1]);
-            err_ = err[0];
-        }
+        err_ = err[0];
     }
     ~Writer() {
         kill();
         ::close(out_);
-        if (err_ >= 0) {
-            ::close(err_);
-        }
+        ::close(err_);
     }
 
     // The next line of stdout; none at its end or after `seconds`.
@@ -125,7 +115,7 @@ class Writer {
         std::string text;
         char buf[4096];
         ssize_t n;
-        while (err_ >= 0 && (n = ::read(err_, buf, sizeof buf)) > 0) {
+        while ((n = ::read(err_, buf, sizeof buf)) > 0) {
             text.append(buf, static_cast<std::size_t>(n));
         }
         return text;
@@ -150,8 +140,7 @@ class Writer {
   private:
     pid_t pid_ = -1;
     int status_ = -1;
-    int out_ = -1;
-    int err_ = -1;
+    int out_ = -1, err_ = -1;
     std::string pending_;
 };
 
@@ -239,7 +228,7 @@ TEST(CrashSafety, WritersKilledAtRandomLeaveEveryStoreOldOrNewAndTheAgentServes)
     // Generation 0 everywhere, and how long one generation of four writes takes here.
     const auto started = SteadyClock::now();
     {
-        Writer writer({home, root, "0", "50"}, false, agent.environment());
+        Writer writer({home, root, "0", "50"}, agent.environment());
         ASSERT_EQ(writer.wait(), 0);
     }
     const double generationSeconds =
@@ -257,7 +246,7 @@ TEST(CrashSafety, WritersKilledAtRandomLeaveEveryStoreOldOrNewAndTheAgentServes)
     std::array<int, 4> killedMidWrite{};  // the store held a generation not yet reported whole
     int beforeAnyWrite = 0, midGeneration = 0;
     for (int kill = 0; kill < kKills; ++kill) {
-        Writer writer({home, root, std::to_string(next)}, false, agent.environment());
+        Writer writer({home, root, std::to_string(next)}, agent.environment());
         ASSERT_EQ(writer.line(10), "ready");
         std::this_thread::sleep_for(std::chrono::microseconds(delayMicros(rng)));
         writer.kill();
@@ -298,12 +287,8 @@ TEST(CrashSafety, WritersKilledAtRandomLeaveEveryStoreOldOrNewAndTheAgentServes)
         static_cast<long long>(next - 1));
 
     // The agent starts on what the writers left and serves the cached warranty.
-    agent.writeRootFile("device.plist", Value::Dictionary{{"SerialNumber", trial::kSerialNumber},
-                                                          {"ProductType", "Phone1,1"},
-                                                          {"ProductVersion", "1.0"}});
-    agent.writeRootFile(
-        "accounts.plist",
-        Value::Dictionary{{"PrimaryCloudAccount", Value::Dictionary{{"altDSID", "crash-trial"}}}});
+    agent.writeDevices(trial::kSerialNumber);
+    agent.writeAccounts();
     agent.registerApplication("tests", test::selfExecutable(), std::nullopt, Value(true));
     ASSERT_TRUE(agent.start()) << agent.log();
     HostIpcClient client;
@@ -324,11 +309,11 @@ TEST(CrashSafety, AFullDiskKeepsTheOldFilesAndLogsTheError) {
     test::TempDir dir;
     const std::string home = (dir.path() / "home").string(), root = (dir.path() / "root").string();
     {
-        Writer writer({home, root, "1", "1"}, false);
+        Writer writer({home, root, "1", "1"});
         ASSERT_EQ(writer.wait(), 0);
     }
     // Every new file is larger than this; the old ones stay readable.
-    Writer writer({"--file-limit", "64", home, root, "2"}, true);
+    Writer writer({"--file-limit", "64", home, root, "2"});
     std::vector<std::string> results;
     while (auto line = writer.line(10)) {
         results.push_back(*line);

@@ -10,7 +10,6 @@
 #include <chrono>
 #include <cmath>
 #include <filesystem>
-#include <future>
 #include <map>
 #include <regex>
 #include <thread>
@@ -19,7 +18,6 @@
 #include "CoverageSimProcess.h"
 #include "core/JsonCodec.h"
 #include "core/PlistCodec.h"
-#include "platform/host/CurlHttpClient.h"
 #include "platform/host/FilePreferenceStore.h"
 #include "platform/host/SystemClock.h"
 
@@ -44,21 +42,11 @@ class OfferRoadTest : public ::testing::Test {
             std::vector<std::string>{"--fixtures", fixtures.str(), "--simulated-clock"});
         ASSERT_FALSE(sim->base().empty());
 
-        agent.writeRootFile("device.plist",
-                            Value(Value::Dictionary{{"SerialNumber", Value(kPhone)},
-                                                    {"ProductType", Value("Phone14,2")},
-                                                    {"ProductVersion", Value("17.2")}}));
+        agent.writeDevices(kPhone, std::nullopt, "17.2");
         agent.writeRootFile(
             "features.plist",
-            Value(Value::Dictionary{{"Kestova", Value(Value::Dictionary{{"Tessel_3_0", true}})}}));
-        agent.writeRootFile(
-            "accounts.plist",
-            Value(Value::Dictionary{
-                {"PrimaryCloudAccount", Value(Value::Dictionary{{"altDSID", "road-primary"}})},
-                {"KFAccount",
-                 Value(Value::Dictionary{{"altDSID", "road-kf"},
-                                         {"TokenServiceURL", sim->base() + "/token"}})},
-                {"StoreAccount", Value(Value::Dictionary{{"storefront", "143441-1,29"}})}}));
+            Value::Dictionary{{"Kestova", Value(Value::Dictionary{{"Tessel_3_0", true}})}});
+        agent.writeAccounts(sim->base() + "/token");
         // qaxctl asks for an outreach as the settings application would.
         agent.registerApplication("settings", QAX_CTL_BINARY, "com.velmora.Preferences",
                                   Value(true));
@@ -68,7 +56,8 @@ class OfferRoadTest : public ::testing::Test {
              {std::pair{"ServerVersionURL", "/library/VELMORA/asset/qaxV2.plist"},
               std::pair{"WarrantyURL", "/api/v3/coverage/summary"},
               std::pair{"WearablesWarrantyURL", "/api/v2/coverage/summary"}}) {
-            ASSERT_EQ(ctl({"defaults", "write", key, "-string", sim->base() + path}).status, 0);
+            ASSERT_EQ(agent.ctl({"defaults", "write", key, "-string", sim->base() + path}).status,
+                      0);
         }
     }
 
@@ -100,10 +89,9 @@ class OfferRoadTest : public ::testing::Test {
         }
     }
 
-    test::ToolResult ctl(const std::vector<std::string>& args) {
-        return test::runTool(QAX_CTL_BINARY, args, agent.environment());
+    void advance(const std::string& by) {
+        ASSERT_EQ(agent.ctl({"clock", "advance", by}).status, 0);
     }
-    void advance(const std::string& by) { ASSERT_EQ(ctl({"clock", "advance", by}).status, 0); }
     bool waitFor(const std::string& text, int times = 1, double seconds = kWait) {
         return agent.waitForLog(text, times, seconds);
     }
@@ -122,7 +110,7 @@ class OfferRoadTest : public ::testing::Test {
     // The activities as `qaxctl activities` shows them, by name without the prefix.
     std::map<std::string, Value> activities() {
         std::map<std::string, Value> byName;
-        auto list = parseJson(ctl({"activities", "--json"}).out);
+        auto list = parseJson(agent.ctl({"activities", "--json"}).out);
         for (const auto& a : list && list->isArray() ? *list->asArray() : Value::Array{}) {
             byName[a.find("identifier")->asString()->substr(sizeof "com.velmora.qaxagent")] = a;
         }
@@ -138,7 +126,7 @@ class OfferRoadTest : public ::testing::Test {
     // The pending follow-ups as the settings application shows them, in short and sorted:
     // "title|days|badge|notification".
     std::vector<std::string> rows() {
-        auto out = ctl({"followups", "--json"});
+        auto out = agent.ctl({"followups", "--json"});
         auto list = parseJson(out.out);
         EXPECT_TRUE(list && list->isArray()) << out.out << out.err;
         std::vector<std::string> rows;
@@ -158,15 +146,7 @@ class OfferRoadTest : public ::testing::Test {
 
     // Sets coverage-sim's scenario (a JSON object), or clears it without one.
     int scenario(std::optional<std::string> body) {
-        CurlHttpClient::Options options;
-        options.extraCAFile = sim->caFile();
-        CurlHttpClient http(options);
-        HttpRequest request(sim->base() + "/admin/scenario", 20);
-        request.setMethod(body ? "POST" : "DELETE");
-        request.setBody(std::move(body));
-        std::promise<HttpResult> done;
-        http.send(request, [&](HttpResult r) { done.set_value(std::move(r)); });
-        auto result = done.get_future().get();
+        auto result = sim->call(body ? "POST" : "DELETE", "/admin/scenario", std::move(body));
         return result.response ? static_cast<int>(result.response->statusCode) : 0;
     }
     // Every cache file of the agent and its bytes.
@@ -215,7 +195,7 @@ TEST_F(OfferRoadTest, FortyDaysOfAnOffer) {
             << name;
     }
     EXPECT_EQ(listed["outreach"].find("lastResult")->description(), "1");
-    EXPECT_NE(ctl({"activities"}).out.find("registration  due"), std::string::npos);
+    EXPECT_NE(agent.ctl({"activities"}).out.find("registration  due"), std::string::npos);
 
     // Day 10: the clock change reaches the agent at once; the post puts the item up, counts it
     // once and starts the refresh chain.
@@ -257,7 +237,7 @@ TEST_F(OfferRoadTest, FortyDaysOfAnOffer) {
     ASSERT_FALSE(cacheBefore.empty());
     ASSERT_EQ(scenario(R"({"ROADPHONE01": ["reset", "reset", "reset", "reset"]})"), 200);
     const int outreachRuns = ends("outreach");
-    ASSERT_EQ(ctl({"schedule-outreach"}).status, 0);
+    ASSERT_EQ(agent.ctl({"schedule-outreach"}).status, 0);
     ASSERT_TRUE(waitForEnds("outreach", outreachRuns + 1)) << agent.log();
     EXPECT_TRUE(agent.countInLog("Warranty failed to download"));
     EXPECT_TRUE(agent.countInLog("Conversion: 0 -- No devices eligible for followUp posts"));
@@ -268,13 +248,13 @@ TEST_F(OfferRoadTest, FortyDaysOfAnOffer) {
 
     // A watch with its own offer (day 15 to 38) is paired: the post is due again on day 15.
     agent.writeRootFile("paired-devices.plist",
-                        Value(Value::Array{Value(Value::Dictionary{{"name", "Road Watch"},
-                                                                   {"localizedModel", "Watch"},
-                                                                   {"serialNumber", kWatch},
-                                                                   {"pairedDate", Value(day(-100))},
-                                                                   {"isPaired", true},
-                                                                   {"isArchived", false}})}));
-    ASSERT_EQ(ctl({"notify", "com.velmora.pairlink.devicedidpair"}).status, 0);
+                        Value::Array{Value(Value::Dictionary{{"name", "Road Watch"},
+                                                             {"localizedModel", "Watch"},
+                                                             {"serialNumber", kWatch},
+                                                             {"pairedDate", Value(day(-100))},
+                                                             {"isPaired", true},
+                                                             {"isArchived", false}})});
+    ASSERT_EQ(agent.ctl({"notify", "com.velmora.pairlink.devicedidpair"}).status, 0);
     ASSERT_TRUE(
         waitFor("Found a new followup post date trigerred after a pairing event. Schedule "
                 "followUp post for: " +
@@ -283,7 +263,7 @@ TEST_F(OfferRoadTest, FortyDaysOfAnOffer) {
     EXPECT_EQ(target("followuppost"), day(15));
 
     // The language changes while the item is shown: the phone's summary comes again in French.
-    ASSERT_EQ(ctl({"locale", "set", "fr_FR"}).status, 0);
+    ASSERT_EQ(agent.ctl({"locale", "set", "fr_FR"}).status, 0);
     ASSERT_TRUE(waitFor("Device infos refreshed after locale change")) << agent.log();
     EXPECT_EQ(rows(), std::vector<std::string>{"Ajoutez le plan Haverly|29|-|-"});
     bool askedInFrench = false;

@@ -45,12 +45,22 @@ std::optional<std::string> serialIn(const Value* reply) {
     return device ? device->serialNumber() : std::nullopt;
 }
 
+// The default device's serial number as `client` (connected to `socket` first if need be) gets it.
+std::optional<std::string> defaultSerial(HostIpcClient& client, const std::string& socket) {
+    std::string error;
+    if (!client.isConnected() && !client.connect(socket, &error)) {
+        return std::nullopt;
+    }
+    auto reply = client.call("defaultDevice:", {}, kWait, &error);
+    return reply && reply->value ? serialIn(&*reply->value) : std::nullopt;
+}
+
 // The service manager keeps its listening socket across instances: this test holds one the
 // same way, hands it to each instance and reads their readiness notices.
 TEST(OnDemandStartTest, IdleExitAndTheNextInstanceKeepStateAndALateClient) {
     test::AgentProcess agent;  // its home, platform root and environment; started here instead
-    agent.writeRootFile("device.plist", Value(Value::Dictionary{{"SerialNumber", Value("OD-1")},
-                                                                {"InternalBuild", Value(true)}}));
+    agent.writeRootFile("device.plist", Value::Dictionary{{"SerialNumber", Value("OD-1")},
+                                                          {"InternalBuild", Value(true)}});
     agent.registerApplication("tests", test::selfExecutable(), std::nullopt, Value(true));
     std::filesystem::create_directories(agent.runtimeDirectory());
     const int listening = bindUnixSocket(SOCK_STREAM, agent.socketPath());
@@ -75,27 +85,17 @@ TEST(OnDemandStartTest, IdleExitAndTheNextInstanceKeepStateAndALateClient) {
         ::close(std::stoi(inherited));
         return process;
     };
-    auto defaultSerial = [&](HostIpcClient& client) -> std::optional<std::string> {
-        std::string error;
-        if (!client.isConnected() && !client.connect(agent.socketPath(), &error)) {
-            return std::nullopt;
-        }
-        auto reply = client.call("defaultDevice:", {}, kWait, &error);
-        return reply && reply->value ? serialIn(&*reply->value) : std::nullopt;
-    };
 
     auto first = start();
     {
         HostIpcClient client;
-        EXPECT_EQ(defaultSerial(client), "OD-1") << agent.log();
+        EXPECT_EQ(defaultSerial(client, agent.socketPath()), "OD-1") << agent.log();
         EXPECT_EQ(receiveNotice(notices), "READY=1\nSTATUS=Serving clients");
         std::this_thread::sleep_for(std::chrono::milliseconds(1500));
         EXPECT_TRUE(first->running()) << "a connected client keeps the agent past its idle time";
-        auto written = test::runTool(QAX_CTL_BINARY,
-                                     {"defaults", "write", "SerialNumber", "-string", "OD-KEPT"},
-                                     agent.environment());
+        auto written = agent.ctl({"defaults", "write", "SerialNumber", "-string", "OD-KEPT"});
         ASSERT_EQ(written.status, 0) << written.err;
-        EXPECT_EQ(defaultSerial(client), "OD-KEPT");
+        EXPECT_EQ(defaultSerial(client, agent.socketPath()), "OD-KEPT");
     }
     // Connects the moment the first instance decides to go.
     ASSERT_TRUE(agent.waitForLog(kExitedIdle, 1, kWait)) << agent.log();
@@ -126,8 +126,8 @@ TEST(OnDemandStartTest, UnderSystemdSocketActivateTheFirstConnectionStartsIt) {
         GTEST_SKIP() << "systemd-socket-activate (Debian package systemd) is not installed";
     }
     test::AgentProcess agent;
-    agent.writeRootFile("device.plist", Value(Value::Dictionary{{"SerialNumber", Value("OD-2")},
-                                                                {"InternalBuild", Value(true)}}));
+    agent.writeRootFile("device.plist", Value::Dictionary{{"SerialNumber", Value("OD-2")},
+                                                          {"InternalBuild", Value(true)}});
     agent.registerApplication("tests", test::selfExecutable(), std::nullopt, Value(true));
     std::filesystem::create_directories(agent.runtimeDirectory());
     std::vector<std::string> args{"-l", agent.socketPath(), "-E", "QAX_IDLE_EXIT_SECONDS=1"};
@@ -135,15 +135,6 @@ TEST(OnDemandStartTest, UnderSystemdSocketActivateTheFirstConnectionStartsIt) {
         args.insert(args.end(), {"-E", variable});
     }
     args.push_back(QAX_AGENT_BINARY);
-    auto defaultSerial = [&]() -> std::optional<std::string> {
-        HostIpcClient client;
-        std::string error;
-        if (!client.connect(agent.socketPath(), &error)) {
-            return std::nullopt;
-        }
-        auto reply = client.call("defaultDevice:", {}, kWait, &error);
-        return reply && reply->value ? serialIn(&*reply->value) : std::nullopt;
-    };
 
     for (int instance = 1; instance <= 2; ++instance) {
         SCOPED_TRACE(instance);
@@ -152,11 +143,13 @@ TEST(OnDemandStartTest, UnderSystemdSocketActivateTheFirstConnectionStartsIt) {
         ASSERT_TRUE(agent.waitForLog("Listening on", listening + 1, kWait)) << agent.log();
         EXPECT_EQ(agent.countInLog("Started on demand"), instance - 1)
             << "nothing starts the agent before a client";
-        EXPECT_EQ(defaultSerial(), instance == 1 ? "OD-2" : "OD-KEPT") << agent.log();
+        {
+            HostIpcClient client;  // gone before the idle exit is awaited
+            EXPECT_EQ(defaultSerial(client, agent.socketPath()), instance == 1 ? "OD-2" : "OD-KEPT")
+                << agent.log();
+        }
         if (instance == 1) {
-            auto written = test::runTool(
-                QAX_CTL_BINARY, {"defaults", "write", "SerialNumber", "-string", "OD-KEPT"},
-                agent.environment());
+            auto written = agent.ctl({"defaults", "write", "SerialNumber", "-string", "OD-KEPT"});
             ASSERT_EQ(written.status, 0) << written.err;
         }
         EXPECT_TRUE(exitedCleanly(activated.waitForExit(kWait))) << agent.log();

@@ -64,7 +64,7 @@ Exchange exchange(int listening, const std::vector<std::string>& environment,
 Value summaryEndingIn(double seconds) {
     using namespace std::chrono;
     const double now = duration<double>(system_clock::now().time_since_epoch()).count();
-    return Value(Value::Dictionary{
+    return Value::Dictionary{
         {"covered", Value(true)},
         {"coverageLocalizedLabel", Value("Limited Warranty")},
         {"hvOfferEligible", Value(true)},
@@ -72,21 +72,17 @@ Value summaryEndingIn(double seconds) {
         {"hvLocalizedOfferLabel", Value("Add the plan")},
         {"hvLocalizedOfferPluralDescFormat", Value("%@ days left")},
         {"featureToggleParameters", Value(Value::Dictionary{{"hvOfferDisplay", Value(true)}})},
-    });
+    };
 }
 
 class QaxctlClientVerbsTest : public ::testing::Test {
   protected:
-    test::ToolResult run(const std::vector<std::string>& args) {
-        return test::runTool(QAX_CTL_BINARY, args, agent.environment());
-    }
-
     test::AgentProcess agent;  // its directories and environment; started only where needed
     test::TestPlatform tp;
 };
 
 TEST_F(QaxctlClientVerbsTest, EachVerbSendsItsRequestAndPrintsTheReply) {
-    auto absent = run({"device-info"});
+    auto absent = agent.ctl({"device-info"});
     EXPECT_EQ(absent.status, 69);
     EXPECT_NE(absent.err.find("is qaxagent running?"), std::string::npos) << absent.err;
     for (const auto& args : std::vector<std::vector<std::string>>{
@@ -98,7 +94,7 @@ TEST_F(QaxctlClientVerbsTest, EachVerbSendsItsRequestAndPrintsTheReply) {
              {"account-added", "--timeout", "soon"},
              {"store-check", "--json"},
          }) {
-        auto result = run(args);
+        auto result = agent.ctl(args);
         EXPECT_EQ(result.status, 64) << args[0] << " " << result.err;
         EXPECT_EQ(result.err.rfind("usage: qaxctl " + args[0], 0), 0u) << result.err;
     }
@@ -144,9 +140,9 @@ TEST_F(QaxctlClientVerbsTest, EachVerbSendsItsRequestAndPrintsTheReply) {
         {{"device-info", "SN-0", "--policy", "7"}, bySerial, {Value("SN-0"), Value(7)}, reply(bare),
          0, "no warranty"},
         {{"device-infos", "--policy", "cached", "--update-followups", "--json"}, all,
-         {Value(1), Value(true)}, reply(Value(Value::Array{offer, bare})), 0,
+         {Value(1), Value(true)}, reply(Value::Array{offer, bare}), 0,
          "\"serialNumber\": \"SN-0\""},
-        {{"device-infos"}, all, {Value(0), Value(false)}, reply(Value(Value::Array{})), 0,
+        {{"device-infos"}, all, {Value(0), Value(false)}, reply(Value::Array{}), 0,
          "No devices."},
         {{"dismiss-followup", "W1"}, dismiss, {Value("W1")}, reply(Value(true)), 0,
          "follow-up of W1 dismissed"},
@@ -170,7 +166,7 @@ TEST_F(QaxctlClientVerbsTest, EachVerbSendsItsRequestAndPrintsTheReply) {
         {{"dismiss-followup", "W1"}, dismiss, {Value("W1")}, reply(Value("yes")), 70,
          "not what was expected"},
         {{"device-infos"}, all, {Value(0), Value(false)},
-         reply(Value(Value::Array{Value(Value::Dictionary{{"$class", Value("QAXDevice")}})})), 70,
+         reply(Value::Array{Value(Value::Dictionary{{"$class", Value("QAXDevice")}})}), 70,
          "not what was expected"},
         // clang-format on
     };

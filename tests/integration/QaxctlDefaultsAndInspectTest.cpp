@@ -30,31 +30,25 @@ class QaxctlDefaultsAndInspect : public ::testing::Test {
 };
 
 TEST_F(QaxctlDefaultsAndInspect, DefaultsWriteReadDeleteAndRefuseBadInput) {
-    struct Row {
-        const char* type;
-        const char* text;
-        const char* key;
-        Value expected;
-    } rows[] = {
+    const std::tuple<const char*, const char*, const char*, Value> rows[] = {
         {"-string", "C02OVERRIDE", "SerialNumber", Value("C02OVERRIDE")},
         {"-int", "2", "QAXMigrationVersion", Value(2)},
         {"-real", "-86400.5", "W1.activationInterval", Value(-86400.5)},
         {"-bool", "yes", "PostUpgradeActivityCompleted", Value(true)},
         {"-date", "2023-11-14T22:13:20Z", "DefaultDeviceActivationDate", Value(Date(1700000000))},
         {"-json", R"({"LowServerVersion":2,"HighServerVersion":"3"})", "ServerVersionOverride",
-         Value(Value::Dictionary{{"LowServerVersion", 2}, {"HighServerVersion", "3"}})},
-        {"-json", R"(["a","b"])", "FollowupPostedSerialNumberHashes",
-         Value(Value::Array{"a", "b"})},
+         Value::Dictionary{{"LowServerVersion", 2}, {"HighServerVersion", "3"}}},
+        {"-json", R"(["a","b"])", "FollowupPostedSerialNumberHashes", Value::Array{"a", "b"}},
     };
-    for (const auto& r : rows) {
-        SCOPED_TRACE(r.text);
-        auto w = ctl({"defaults", "write", r.key, r.type, r.text});
+    for (const auto& [type, text, key, expected] : rows) {
+        SCOPED_TRACE(text);
+        auto w = ctl({"defaults", "write", key, type, text});
         ASSERT_EQ(w.status, 0) << w.err;
-        EXPECT_EQ(agentView.objectForKey(r.key), r.expected);
+        EXPECT_EQ(agentView.objectForKey(key), expected);
     }
     auto read = ctl({"defaults", "read", "ServerVersionOverride", "--json"});
     ASSERT_EQ(read.status, 0);
-    EXPECT_EQ(parseJson(read.out), rows[5].expected);
+    EXPECT_EQ(parseJson(read.out), std::get<3>(rows[5]));
     // A key with only a registered default reads that default.
     EXPECT_EQ(ctl({"defaults", "read", "CachedWarrantyValidityDuration"}).out, "86400\n");
     auto all = parseJson(ctl({"defaults", "read", "--json"}).out);

@@ -81,15 +81,9 @@ class QaxctlExplainTest : public ::testing::Test {
         agent.extraEnvironment = {
             "QAX_CLOCK=simulated", "QAX_NETWORK=down", "QAX_BOOT_ID=explain-boot",
             "QAX_SHARE_DIR=" + std::string(QAX_SOURCE_DIR) + "/share/qaxagent"};
-        agent.writeRootFile("device.plist",
-                            Value(Value::Dictionary{{"SerialNumber", Value(kPhone)},
-                                                    {"ProductType", Value("Phone14,2")},
-                                                    {"ProductVersion", Value("17.2")}}));
-        agent.writeRootFile("accounts.plist",
-                            Value(Value::Dictionary{{"PrimaryCloudAccount",
-                                                     Value(Value::Dictionary{{"altDSID", "a"}})}}));
-        agent.writeRootFile("locale.plist",
-                            Value(Value::Dictionary{{"PreferredLocale", Value("en_US")}}));
+        agent.writeDevices(kPhone, std::nullopt, "17.2");
+        agent.writeAccounts();
+        agent.writeRootFile("locale.plist", Value::Dictionary{{"PreferredLocale", Value("en_US")}});
         // This boot and this system version are behind the agent already: its start-up runs
         // no upgrade or boot work, only what is registered.
         ASSERT_TRUE(HostActivityTriggerRecord::save(
@@ -117,7 +111,7 @@ class QaxctlExplainTest : public ::testing::Test {
         auto ms = [&](double days) {
             return Value(static_cast<std::int64_t>((start + days * kDay) * 1000));
         };
-        return Value(Value::Dictionary{
+        return Value::Dictionary{
             {"covered", true},
             {"hvOfferEligible", true},
             {"hvOfferEligibleUntil", ms(endsInDays)},
@@ -135,7 +129,7 @@ class QaxctlExplainTest : public ::testing::Test {
                                      {"hvOfferDurationDaysBeforeEndDate", 30}})},
             {"hvOfferBadgeBeforeEndDate", 7},
             {"showNotificationToggle", true},
-            {"showNotificationBeforeEndDate", 3}});
+            {"showNotificationBeforeEndDate", 3}};
     }
 
     // The cache file and its keys, as a download leaves them.
@@ -167,12 +161,10 @@ class QaxctlExplainTest : public ::testing::Test {
         platform->preferences->setObject(QAXScheduler::targetDateKey(kRefresh), Value(now));
     }
 
-    test::ToolResult ctl(const std::vector<std::string>& args) {
-        return test::runTool(QAX_CTL_BINARY, args, agent.environment());
-    }
     void advanceTo(Date date) {
         const double by = std::ceil(date.timeIntervalSince(platform->clock->now()));
-        ASSERT_EQ(ctl({"clock", "advance", std::to_string(static_cast<long long>(by))}).status, 0);
+        ASSERT_EQ(
+            agent.ctl({"clock", "advance", std::to_string(static_cast<long long>(by))}).status, 0);
         std::static_pointer_cast<SimulatedClock>(platform->clock)->reloadOffset();
     }
     // Runs explain and checks that it changed no file of the home and platform root.
@@ -180,11 +172,11 @@ class QaxctlExplainTest : public ::testing::Test {
         const auto before = fingerprint(agent.home());
         std::vector<std::string> args{"explain", "--json"};
         args.insert(args.end(), extra.begin(), extra.end());
-        auto r = ctl(args);
+        auto r = agent.ctl(args);
         EXPECT_EQ(r.status, 0) << r.err;
         EXPECT_EQ(fingerprint(agent.home()), before) << "explain changed a file";
         args.erase(args.begin() + 1);
-        auto text = ctl(args);
+        auto text = agent.ctl(args);
         EXPECT_EQ(text.status, 0) << text.err;
         EXPECT_EQ(fingerprint(agent.home()), before) << "explain changed a file";
         if (textOut) {
@@ -214,7 +206,7 @@ class QaxctlExplainTest : public ::testing::Test {
         return r == records.end() ? std::nullopt : r->second.dueDate;
     }
     Value followUp() {
-        auto list = parseJson(ctl({"followups", "--json"}).out);
+        auto list = parseJson(agent.ctl({"followups", "--json"}).out);
         return list && list->isArray() && list->asArray()->size() == 1 ? list->asArray()->front()
                                                                        : Value();
     }
@@ -251,25 +243,23 @@ TEST_F(QaxctlExplainTest, PredictsWhatTheAgentsRefreshDoes) {
 
     // Past the badge date: explain says a refresh turns the badge on, and the agent's refresh
     // does, then schedules the next refresh when explain said it would.
-    struct Step {
-        Date to;
-        bool badge, notification;
-    } steps[] = {{badgeOn->byAdding(60), true, false}, {notificationOn->byAdding(60), true, true}};
-    for (const auto& step : steps) {
-        SCOPED_TRACE(step.to.description());
-        advanceTo(step.to);
+    const std::tuple<Date, bool, bool> steps[] = {{badgeOn->byAdding(60), true, false},
+                                                  {notificationOn->byAdding(60), true, true}};
+    for (const auto& [to, badge, notification] : steps) {
+        SCOPED_TRACE(to.description());
+        advanceTo(to);
         x = explain();
-        EXPECT_EQ(at(x, "offer.badge.on").truthy(), step.badge);
-        EXPECT_EQ(at(x, "offer.notification.on").truthy(), step.notification);
-        expectAt(x, {{"refresh.updatesThisDevice", true}, {"refresh.item.badge", step.badge}});
+        EXPECT_EQ(at(x, "offer.badge.on").truthy(), badge);
+        EXPECT_EQ(at(x, "offer.notification.on").truthy(), notification);
+        expectAt(x, {{"refresh.updatesThisDevice", true}, {"refresh.item.badge", badge}});
         const auto next = dateAt(x, "refresh.nextRefreshDate");
         ASSERT_TRUE(next);
         registerRefreshNow();
         runAgentRefresh();
         const Value item = followUp();
         ASSERT_TRUE(item.isDictionary()) << agent.log();
-        EXPECT_EQ(*item.find("badge"), Value(step.badge)) << item.description();
-        EXPECT_EQ(item.find("notification") != nullptr, step.notification) << item.description();
+        EXPECT_EQ(*item.find("badge"), Value(badge)) << item.description();
+        EXPECT_EQ(item.find("notification") != nullptr, notification) << item.description();
         EXPECT_EQ(*item.find("dayText"), at(x, "refresh.item.dayText"));
         // The platform keeps whole seconds of the delay.
         const auto due = refreshDue();
@@ -291,20 +281,15 @@ TEST_F(QaxctlExplainTest, PredictsWhatTheAgentsRefreshDoes) {
 }
 
 TEST_F(QaxctlExplainTest, DismissalConversionAndActivationAgreeWithThePostRule) {
-    struct Row {
-        const char* name;
-        double dismissedDaysAgo;  // < 0: not dismissed
-        double activatedInDays;
-        const char* postRule;
-        bool reopens, moved;
-    } rows[] = {
+    // A dismissal (days ago; < 0: none), the activation, and what explain and the rule say.
+    const std::tuple<const char*, double, double, const char*, bool, bool> rows[] = {
         {"dismissed before the offer opened", 8, -60, "due", true, false},
         {"dismissed after it opened", 2, -60, "dismissed", false, false},
         {"activated after it opened", -1, 2, "futurePostDate", false, true},
     };
     cacheSummary(summary(5, 20));
-    for (const auto& row : rows) {
-        SCOPED_TRACE(row.name);
+    for (const auto& [name, dismissedDaysAgo, activatedInDays, postRule, reopens, moved] : rows) {
+        SCOPED_TRACE(name);
         auto& prefs = *platform->preferences;
         const std::string hash = sha256Hash(kPhone);
         for (const char* key :
@@ -313,21 +298,19 @@ TEST_F(QaxctlExplainTest, DismissalConversionAndActivationAgreeWithThePostRule) 
             prefs.removeObject(key);
         }
         prefs.removeObject(hash + ".dismissed");
-        if (row.dismissedDaysAgo >= 0) {
-            prefs.setObject("FollowupDismissedSerialNumberHashes",
-                            Value(Value::Array{Value(hash)}));
-            prefs.setObject(hash + ".dismissed", Value(Date(start - row.dismissedDaysAgo * kDay)));
+        if (dismissedDaysAgo >= 0) {
+            prefs.setObject("FollowupDismissedSerialNumberHashes", Value::Array{Value(hash)});
+            prefs.setObject(hash + ".dismissed", Value(Date(start - dismissedDaysAgo * kDay)));
         }
-        prefs.setObject("DefaultDeviceActivationDate",
-                        Value(Date(start + row.activatedInDays * kDay)));
+        prefs.setObject("DefaultDeviceActivationDate", Value(Date(start + activatedInDays * kDay)));
         const Value x = explain({kPhone});
-        expectAt(x, {{"offer.postRule", row.postRule},
-                     {"offer.conversionReopens", row.reopens},
-                     {"offer.postDateMovedByActivation", row.moved},
-                     {"post.postsThisDevice", std::string(row.postRule) == "due"}});
+        expectAt(x, {{"offer.postRule", postRule},
+                     {"offer.conversionReopens", reopens},
+                     {"offer.postDateMovedByActivation", moved},
+                     {"post.postsThisDevice", std::string(postRule) == "due"}});
         // The agent's post rule, for real on these files, does what explain said.
         EXPECT_EQ(QAXFollowUp(platform).postFollowUpWithDevicesInfo({phoneInfo()}),
-                  std::string(row.postRule) == "due");
+                  std::string(postRule) == "due");
     }
 }
 
@@ -337,12 +320,8 @@ TEST_F(QaxctlExplainTest, BadInputGetsAClearAnswer) {
     const fs::path cacheFile = fs::path(agent.home()) /
                                "Library/Application Support/com.velmora.Kestova" /
                                (sha256Hash(kPhone) + "_Warranty.plist");
-    struct Row {
-        const char* name;
-        std::vector<std::string> args;
-        fs::path corrupt;  // written with garbage first
-        const char* text;  // in the text output
-    } rows[] = {
+    // The arguments, a file written with garbage first, and what the text output says.
+    const std::tuple<const char*, std::vector<std::string>, fs::path, const char*> rows[] = {
         {"unknown serial", {"NOSUCHSERIAL"}, {}, "tracks no device with the serial number"},
         {"no cache", {"NOSUCHSERIAL"}, {}, "No cached warranty"},
         {"corrupt follow-up store",
@@ -356,18 +335,18 @@ TEST_F(QaxctlExplainTest, BadInputGetsAClearAnswer) {
          fs::path(agent.home()) / "Library/Preferences/com.velmora.qaxagent.plist",
          "Preference domain file"},
     };
-    for (const auto& row : rows) {
-        SCOPED_TRACE(row.name);
-        if (!row.corrupt.empty()) {
-            test::writeFile(row.corrupt, "<plist><dict><key>x</key>");
+    for (const auto& [name, args, corrupt, said] : rows) {
+        SCOPED_TRACE(name);
+        if (!corrupt.empty()) {
+            test::writeFile(corrupt, "<plist><dict><key>x</key>");
         }
         std::string text;
-        explain(row.args, &text);
-        EXPECT_NE(text.find(row.text), std::string::npos) << text;
+        explain(args, &text);
+        EXPECT_NE(text.find(said), std::string::npos) << text;
     }
     for (const auto& bad :
          std::vector<std::vector<std::string>>{{"explain", "A", "B"}, {"explain", "--verbose"}}) {
-        EXPECT_EQ(ctl(bad).status, 64) << bad.back();
+        EXPECT_EQ(agent.ctl(bad).status, 64) << bad.back();
     }
 }
 

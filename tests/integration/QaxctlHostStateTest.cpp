@@ -21,11 +21,8 @@ const std::string kShare = std::string(QAX_SOURCE_DIR) + "/share/qaxagent";
 class QaxctlHostState : public ::testing::Test {
   protected:
     QaxctlHostState() { r.extraEnvironment = {"QAX_SHARE_DIR=" + kShare, "QAX_CLOCK=simulated"}; }
-    test::ToolResult qaxctl(const std::vector<std::string>& args) const {
-        return test::runTool(QAX_CTL_BINARY, args, r.environment());
-    }
     Value json(const std::vector<std::string>& args) const {
-        auto result = qaxctl(args);
+        auto result = r.ctl(args);
         EXPECT_EQ(result.status, 0) << result.err;
         return parseJson(result.out).value_or(Value());
     }
@@ -40,39 +37,37 @@ double offsetOf(const Value& clock) {
 
 TEST_F(QaxctlHostState, ClockAndDefer) {
     EXPECT_EQ(offsetOf(json({"clock", "--json"})), 0);
-    struct Row {
-        const char* amount;
-        double offset;  // after the step
-    } rows[] = {{"3d", 259200}, {"5h", 277200}, {"90s", 277290}, {"30", 277320}, {"-1.5d", 147720}};
-    for (const auto& row : rows) {
-        SCOPED_TRACE(row.amount);
-        auto advanced = qaxctl({"clock", "advance", row.amount});
+    const std::pair<const char*, double> rows[] = {
+        {"3d", 259200}, {"5h", 277200}, {"90s", 277290}, {"30", 277320}, {"-1.5d", 147720}};
+    for (const auto& [amount, offset] : rows) {
+        SCOPED_TRACE(amount);
+        auto advanced = r.ctl({"clock", "advance", amount});
         ASSERT_EQ(advanced.status, 0) << advanced.err << " (no agent listening is no error)";
         auto clock = json({"clock", "--json"});
-        EXPECT_EQ(offsetOf(clock), row.offset);
+        EXPECT_EQ(offsetOf(clock), offset);
         auto now = Date::parseIso8601(*clock.find("now")->asString());
         auto system = Date::parseIso8601(*clock.find("systemTime")->asString());
-        EXPECT_NEAR(now->timeIntervalSince(*system), row.offset, 0.01);
+        EXPECT_NEAR(now->timeIntervalSince(*system), offset, 0.01);
     }
-    ASSERT_EQ(qaxctl({"clock", "set", "2030-01-01T00:00:00Z"}).status, 0);
+    ASSERT_EQ(r.ctl({"clock", "set", "2030-01-01T00:00:00Z"}).status, 0);
     auto now = Date::parseIso8601(*json({"clock", "--json"}).find("now")->asString());
     EXPECT_NEAR(now->timeIntervalSince(*Date::parseIso8601("2030-01-01T00:00:00Z")), 0, 5);
 
     const std::string before = test::readFile(state() / "clock.plist");
     for (const auto& bad : std::vector<std::vector<std::string>>{
              {"clock", "advance", "3x"}, {"clock", "set", "tomorrow"}, {"clock", "advance"}}) {
-        EXPECT_EQ(qaxctl(bad).status, 64) << bad.back();
+        EXPECT_EQ(r.ctl(bad).status, 64) << bad.back();
     }
     EXPECT_EQ(test::readFile(state() / "clock.plist"), before);
 
     const fs::path deferFile = state() / "defer";
-    EXPECT_EQ(qaxctl({"defer"}).out, "off\n");
-    ASSERT_EQ(qaxctl({"defer", "on"}).status, 0);
+    EXPECT_EQ(r.ctl({"defer"}).out, "off\n");
+    ASSERT_EQ(r.ctl({"defer", "on"}).status, 0);
     EXPECT_TRUE(fs::exists(deferFile));
-    EXPECT_EQ(qaxctl({"defer"}).out, "on\n");
-    ASSERT_EQ(qaxctl({"defer", "off"}).status, 0);
+    EXPECT_EQ(r.ctl({"defer"}).out, "on\n");
+    ASSERT_EQ(r.ctl({"defer", "off"}).status, 0);
     EXPECT_FALSE(fs::exists(deferFile));
-    EXPECT_EQ(qaxctl({"defer", "maybe"}).status, 64);
+    EXPECT_EQ(r.ctl({"defer", "maybe"}).status, 64);
 }
 
 TEST_F(QaxctlHostState, FollowUpsAsTheSettingsApplicationWouldShowThem) {
@@ -101,24 +96,21 @@ TEST_F(QaxctlHostState, FollowUpsAsTheSettingsApplicationWouldShowThem) {
     post("a", 2 | 1, true);
     post("b", 2 | 16, false);
 
-    struct Step {
-        const char* advance;  // before looking
-        const char* dayText;  // of both items; none once expired
-        bool expired;
-    } steps[] = {
+    // The clock advanced before looking; both items' day text (none once expired); expired.
+    const std::tuple<const char*, const char*, bool> steps[] = {
         {nullptr, "3 days left", false}, {"2d", "1 day left", false}, {"1d", nullptr, true}};
-    for (const auto& s : steps) {
-        SCOPED_TRACE(s.advance ? s.advance : "now");
-        if (s.advance) {
-            ASSERT_EQ(qaxctl({"clock", "advance", s.advance}).status, 0);
+    for (const auto& [advance, dayText, expired] : steps) {
+        SCOPED_TRACE(advance ? advance : "now");
+        if (advance) {
+            ASSERT_EQ(r.ctl({"clock", "advance", advance}).status, 0);
         }
         auto list = json({"followups", "--json"});
         ASSERT_TRUE(list.isArray());
         ASSERT_EQ(list.size(), 2u);
         for (const auto& item : *list.asArray()) {
-            EXPECT_EQ(*item.find("expired"), Value(s.expired));
-            if (s.dayText) {
-                EXPECT_EQ(*item.find("dayText"), Value(s.dayText));
+            EXPECT_EQ(*item.find("expired"), Value(expired));
+            if (dayText) {
+                EXPECT_EQ(*item.find("dayText"), Value(dayText));
             } else {
                 EXPECT_FALSE(item.find("dayText"));
             }
@@ -126,10 +118,10 @@ TEST_F(QaxctlHostState, FollowUpsAsTheSettingsApplicationWouldShowThem) {
         const Value& a = (*list.asArray())[0];
         EXPECT_EQ(*a.find("badge"), Value(true));
         EXPECT_EQ(*a.find("target"), Value("com.velmora.Preferences"));
-        EXPECT_EQ(*a.find("notification"), Value(Value::Dictionary{{"title", "Offer"},
-                                                                   {"text", "Ends soon"},
-                                                                   {"activateLabel", "Details"},
-                                                                   {"clearLabel", "Clear"}}));
+        EXPECT_EQ(*a.find("notification"), (Value::Dictionary{{"title", "Offer"},
+                                                              {"text", "Ends soon"},
+                                                              {"activateLabel", "Details"},
+                                                              {"clearLabel", "Clear"}}));
         EXPECT_EQ(*(*list.asArray())[1].find("badge"), Value(false));
     }
 }

@@ -49,14 +49,14 @@ TEST(BinaryPlistWriterTest, ReadsBackAsTheGeneralCodecsDocument) {
         Value(Date(-1e9)),
         Value(Value::Data{}),
         Value(Value::Data(40, 0xab)),
-        Value(Value::Array{}),
-        Value(Value::Dictionary{}),
-        Value(Value::Dictionary{
+        Value::Array{},
+        Value::Dictionary{},
+        Value::Dictionary{
             {"id", Value(7)},
             {"reply", Value(Value::Dictionary{{"$class", "QAXDevice"},
                                               {"name", "Watch"},
                                               {"activationDate", Date(1700000000)},
-                                              {"list", Value::Array{Value(1), Value("two")}}})}}),
+                                              {"list", Value::Array{Value(1), Value("two")}}})}},
         arrayOf(300),  // two-byte object references
     };
     for (const Value& v : values) {
@@ -73,11 +73,10 @@ TEST(BinaryPlistWriterTest, ReadsBackAsTheGeneralCodecsDocument) {
 // reading answers as the library does (the same value, or none).
 TEST(BinaryPlistWriterTest, DirectReadingAgreesWithTheLibraryOnDamagedDocuments) {
     const Value requests[] = {
-        Value(Value::Dictionary{
-            {"id", Value(1)}, {"op", "defaultDevice:"}, {"args", Value::Array{}}}),
-        Value(Value::Dictionary{{"id", Value(300)},
-                                {"op", "getAllDeviceInfosUsingPolicy:updateFollowUps:withReply:"},
-                                {"args", Value::Array{Value(2), Value(true), Value("C02SERIAL")}}}),
+        Value::Dictionary{{"id", Value(1)}, {"op", "defaultDevice:"}, {"args", Value::Array{}}},
+        Value::Dictionary{{"id", Value(300)},
+                          {"op", "getAllDeviceInfosUsingPolicy:updateFollowUps:withReply:"},
+                          {"args", Value::Array{Value(2), Value(true), Value("C02SERIAL")}}},
         arrayOf(20),
     };
     int compared = 0;
@@ -100,8 +99,8 @@ TEST(BinaryPlistWriterTest, DirectReadingAgreesWithTheLibraryOnDamagedDocuments)
 TEST(BinaryPlistWriterTest, RefusesWhatHasNoPropertyListForm) {
     const Value values[] = {
         Value(),
-        Value(Value::Array{Value(1), Value()}),
-        Value(Value::Dictionary{{"a", Value(Value::Dictionary{{"b", Value()}})}}),
+        Value::Array{Value(1), Value()},
+        Value::Dictionary{{"a", Value(Value::Dictionary{{"b", Value()}})}},
         Value(Date(1e12)),
         Value(Date(std::numeric_limits<double>::quiet_NaN())),
     };
@@ -121,7 +120,7 @@ TEST(BinaryPlistWriterTest, FramesCarryTheirLengthAndInvalidTextReadsAsReplaceme
     ASSERT_EQ(decoder.next(payload), IpcFrameCodec::Status::Frame);
     EXPECT_FALSE(decoder.hasPartialFrame());
     EXPECT_EQ(parsePlist(payload),
-              Value(Value::Dictionary{{"id", Value(1)}, {"error", "bad \xef\xbf\xbd byte"}}));
+              (Value::Dictionary{{"id", Value(1)}, {"error", "bad \xef\xbf\xbd byte"}}));
 }
 
 }  // namespace

@@ -11,6 +11,8 @@
 #include <thread>
 #include <vector>
 
+#include "core/VirtualTimeTaskRunner.h"
+#include "fakes/Await.h"
 #include "fakes/FakeServices.h"
 #include "fakes/TestHttpsServer.h"
 #include "fakes/TestPlatform.h"
@@ -67,14 +69,7 @@ CurlHttpClient::Options trusting(const TestHttpsServer& server) {
 }
 
 HttpResult sendAndWait(HttpClient& client, const HttpRequest& request) {
-    auto promise = std::make_shared<std::promise<HttpResult>>();
-    auto future = promise->get_future();
-    client.send(request, [promise](HttpResult r) { promise->set_value(std::move(r)); });
-    if (future.wait_for(20s) != std::future_status::ready) {
-        ADD_FAILURE() << "no completion for " << request.url();
-        return HttpResult{std::nullopt, "test timed out"};
-    }
-    return future.get();
+    return test::await<HttpResult>([&](auto done) { client.send(request, done); });
 }
 
 TEST(CurlHttpClientTest, RunsTransfersConcurrentlyAndCompletesEachOnceOnTheSessionThread) {
@@ -111,24 +106,11 @@ TEST(CurlHttpClientTest, RunsTransfersConcurrentlyAndCompletesEachOnceOnTheSessi
 }
 
 TEST(CurlHttpClientTest, CompletionsRunOnTheCompletionQueueWhenOneIsGiven) {
-    // Holds what is posted until the test runs it.
-    struct HeldQueue : TaskRunner {
-        std::mutex mutex;
-        std::condition_variable posted;
-        std::vector<Task> tasks;
-        void post(Task task) override {
-            std::lock_guard<std::mutex> lock(mutex);
-            tasks.push_back(std::move(task));
-            posted.notify_all();
-        }
-        void postDelayed(Task task, double) override { post(std::move(task)); }
-    };
     TestHttpsServer server;
-    server.server().Get("/ok", [](const httplib::Request&, httplib::Response& res) {
-        res.set_content("ok", "text/plain");
-    });
+    server.answer("/ok", {200, "ok", "text/plain"});
     server.start();
-    auto queue = std::make_shared<HeldQueue>();
+    // Holds what is posted until the test runs it.
+    auto queue = std::make_shared<VirtualTimeTaskRunner>(std::make_shared<ManualClock>());
     auto options = trusting(server);
     options.completionQueue = queue;
     CurlHttpClient client(options);
@@ -139,16 +121,12 @@ TEST(CurlHttpClientTest, CompletionsRunOnTheCompletionQueueWhenOneIsGiven) {
         body = r.response ? r.response->body : r.error;
         ++completions;
     });
-    std::vector<Task> tasks;
-    {
-        std::unique_lock<std::mutex> lock(queue->mutex);
-        ASSERT_TRUE(queue->posted.wait_for(lock, 20s, [&] { return !queue->tasks.empty(); }));
-        tasks.swap(queue->tasks);
+    for (int i = 0; i < 4000 && queue->pendingCount() == 0; ++i) {
+        std::this_thread::sleep_for(5ms);
     }
+    ASSERT_EQ(queue->pendingCount(), 1u);
     EXPECT_EQ(completions, 0);
-    for (auto& task : tasks) {
-        task();
-    }
+    queue->runUntilIdle();
     EXPECT_EQ(completions, 1);
     EXPECT_EQ(body, "ok");
 }
@@ -156,9 +134,7 @@ TEST(CurlHttpClientTest, CompletionsRunOnTheCompletionQueueWhenOneIsGiven) {
 TEST(CurlHttpClientTest, TransportFailuresComeBackAsErrors) {
     Gate gate;  // outlives the server's handler threads
     TestHttpsServer server;
-    server.server().Get("/ok", [](const httplib::Request&, httplib::Response& res) {
-        res.set_content("ok", "text/plain");
-    });
+    server.answer("/ok", {200, "ok", "text/plain"});
     server.server().Get("/slow", [&gate](const httplib::Request&, httplib::Response& res) {
         gate.arrive();
         gate.waitForRelease();
@@ -176,38 +152,31 @@ TEST(CurlHttpClientTest, TransportFailuresComeBackAsErrors) {
                     "<key>ExtraCAFile</key><string>ca.pem</string></dict></plist>");
     test::TempDir emptyRoot;
 
-    struct Case {
-        const char* name;
-        CurlHttpClient::Options options;
-        std::string url;
-        double timeout;
-        bool succeeds;
-        const char* errorFragment;
-    };
     CurlHttpClient::Options strangerCA;
     strangerCA.extraCAFile = stranger.caFile();
-    const Case cases[] = {
-        {"tls.plist names the CA", CurlHttpClient::optionsForPlatformRoot(root.str()),
-         server.url("/ok"), 10, true, ""},
-        {"tls.plist names the CA relative to the root",
-         CurlHttpClient::optionsForPlatformRoot(relativeRoot.str()), server.url("/ok"), 10, true,
-         ""},
-        {"system CAs only", CurlHttpClient::optionsForPlatformRoot(emptyRoot.str()),
-         server.url("/ok"), 10, false, "SSL"},
-        {"another CA", strangerCA, server.url("/ok"), 10, false, "SSL"},
-        {"nothing listens", trusting(server),
-         "https://127.0.0.1:" + std::to_string(test::unusedLocalPort()) + "/ok", 10, false,
-         "connect"},
-        {"time-out", trusting(server), server.url("/slow"), 0.3, false, "Timeout"},
-        {"not a URL", trusting(server), "not a url at all", 10, false, ""},
-    };
-    for (const auto& c : cases) {
-        SCOPED_TRACE(c.name);
-        CurlHttpClient client(c.options);
-        auto result = sendAndWait(client, HttpRequest(c.url, c.timeout));
-        EXPECT_EQ(result.response.has_value(), c.succeeds) << result.error;
-        EXPECT_EQ(result.error.empty(), c.succeeds) << result.error;
-        EXPECT_NE(result.error.find(c.errorFragment), std::string::npos) << result.error;
+    const std::tuple<const char*, CurlHttpClient::Options, std::string, double, bool, const char*>
+        cases[] = {
+            {"tls.plist names the CA", CurlHttpClient::optionsForPlatformRoot(root.str()),
+             server.url("/ok"), 10, true, ""},
+            {"tls.plist names the CA relative to the root",
+             CurlHttpClient::optionsForPlatformRoot(relativeRoot.str()), server.url("/ok"), 10,
+             true, ""},
+            {"system CAs only", CurlHttpClient::optionsForPlatformRoot(emptyRoot.str()),
+             server.url("/ok"), 10, false, "SSL"},
+            {"another CA", strangerCA, server.url("/ok"), 10, false, "SSL"},
+            {"nothing listens", trusting(server),
+             "https://127.0.0.1:" + std::to_string(test::unusedLocalPort()) + "/ok", 10, false,
+             "connect"},
+            {"time-out", trusting(server), server.url("/slow"), 0.3, false, "Timeout"},
+            {"not a URL", trusting(server), "not a url at all", 10, false, ""},
+        };
+    for (const auto& [name, options, url, timeout, succeeds, errorFragment] : cases) {
+        SCOPED_TRACE(name);
+        CurlHttpClient client(options);
+        auto result = sendAndWait(client, HttpRequest(url, timeout));
+        EXPECT_EQ(result.response.has_value(), succeeds) << result.error;
+        EXPECT_EQ(result.error.empty(), succeeds) << result.error;
+        EXPECT_NE(result.error.find(errorFragment), std::string::npos) << result.error;
     }
     gate.release();
 }
@@ -261,9 +230,7 @@ TEST(CurlHttpClientTest, DestructionCompletesOutstandingTransfersWithAnError) {
         gate.waitForRelease();
         res.set_content("too late", "text/plain");
     });
-    server.server().Get("/ok", [](const httplib::Request&, httplib::Response& res) {
-        res.set_content("ok", "text/plain");
-    });
+    server.answer("/ok", {200, "ok", "text/plain"});
     server.start();
 
     std::atomic<int> calls{0}, errors{0};

@@ -51,12 +51,10 @@ TEST(DryRunPlatform, ReadsThroughWritesToMemoryOnly) {
     prefs.registerDefaults({{"b", Value(9)}, {"c", Value(3)}});
     prefs.setObject("a", Value(10));
     prefs.removeObject("b");
-    struct Row {
-        const char* key;
-        std::optional<Value> value;
-    } rows[] = {{"a", Value(10)}, {"b", Value(9)}, {"c", Value(3)}, {"d", std::nullopt}};
-    for (const auto& row : rows) {
-        EXPECT_EQ(prefs.objectForKey(row.key), row.value) << row.key;
+    const std::pair<const char*, std::optional<Value>> rows[] = {
+        {"a", Value(10)}, {"b", Value(9)}, {"c", Value(3)}, {"d", std::nullopt}};
+    for (const auto& [key, value] : rows) {
+        EXPECT_EQ(prefs.objectForKey(key), value) << key;
     }
     EXPECT_EQ(prefs.allKeys(), std::vector<std::string>{"a"});
     EXPECT_EQ(dry.preferences().changes().size(), 2u);

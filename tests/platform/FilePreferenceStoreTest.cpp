@@ -23,7 +23,7 @@ class FilePreferenceStoreTest : public ::testing::Test {
     std::string path = FilePreferenceStore::domainPath(env.home.str());
 };
 
-TEST_F(FilePreferenceStoreTest, RegisteredDefaultStoredValueAndRemoval) {
+TEST_F(FilePreferenceStoreTest, RegisteredDefaultsStoredValuesRemovalAndTypedReads) {
     FilePreferenceStore store(path);
     qax_registerDefaults(store);
     const std::string registered = settings::kDefaultWarrantyURL;
@@ -41,11 +41,8 @@ TEST_F(FilePreferenceStoreTest, RegisteredDefaultStoredValueAndRemoval) {
     ASSERT_TRUE(onDisk);
     EXPECT_EQ(onDisk->find("WarrantyURL"), nullptr);
     EXPECT_EQ(onDisk->find("CachedWarrantyValidityDuration"), nullptr);
-}
 
-TEST_F(FilePreferenceStoreTest, TypedReadsOfAbsentAndPresentKeys) {
-    FilePreferenceStore store(path);
-    qax_registerDefaults(store);
+    // Typed reads of absent, registered and stored keys.
     EXPECT_FALSE(store.boolForKey("PostUpgradeActivityCompleted"));
     EXPECT_EQ(store.integerForKey("QAXMigrationVersion"), 0);
     EXPECT_EQ(store.doubleForKey("Nothing"), 0.0);
@@ -58,22 +55,16 @@ TEST_F(FilePreferenceStoreTest, TypedReadsOfAbsentAndPresentKeys) {
     EXPECT_EQ(store.integerForKey("HighServerVersion"), 3);
     EXPECT_EQ(settings::migrationVersion(store), 0);
 
-    struct Row {
-        const char* key;
-        Value stored;
-        bool asBool;
-        std::int64_t asInt;
-        double asDouble;
-    } rows[] = {
+    const std::tuple<const char*, Value, bool, std::int64_t, double> rows[] = {
         {"b", Value(true), true, 1, 1.0},    {"i", Value(2), true, 2, 2.0},
         {"r", Value(2.75), true, 2, 2.75},   {"s", Value("12.5"), true, 12, 12.5},
         {"yes", Value("YES"), true, 0, 0.0}, {"zero", Value(0), false, 0, 0.0},
     };
-    for (const auto& r : rows) {
-        ASSERT_TRUE(store.setObject(r.key, r.stored));
-        EXPECT_EQ(store.boolForKey(r.key), r.asBool) << r.key;
-        EXPECT_EQ(store.integerForKey(r.key), r.asInt) << r.key;
-        EXPECT_EQ(store.doubleForKey(r.key), r.asDouble) << r.key;
+    for (const auto& [key, stored, asBool, asInt, asDouble] : rows) {
+        ASSERT_TRUE(store.setObject(key, stored));
+        EXPECT_EQ(store.boolForKey(key), asBool) << key;
+        EXPECT_EQ(store.integerForKey(key), asInt) << key;
+        EXPECT_EQ(store.doubleForKey(key), asDouble) << key;
     }
     ASSERT_TRUE(store.setObject("QAXMigrationVersion", Value(2)));
     EXPECT_EQ(settings::migrationVersion(store), 2);
@@ -100,7 +91,7 @@ TEST_F(FilePreferenceStoreTest, WithinASnapshotScopeFilesAreLookedAtOnce) {
     const std::string device = env.home.str() + "/device.plist";
     CachedPlistFile deviceFile(device);
     ASSERT_TRUE(engineer.setObject("SerialNumber", Value("FIRST")));
-    writeFile(device, *toXmlPlist(Value(Value::Dictionary{{"SerialNumber", "FIRST"}})));
+    writeFile(device, *toXmlPlist(Value::Dictionary{{"SerialNumber", "FIRST"}}));
     auto serials = [&] {
         auto root = deviceFile.read();
         const Value* serial = root ? root->find("SerialNumber") : nullptr;
@@ -111,7 +102,7 @@ TEST_F(FilePreferenceStoreTest, WithinASnapshotScopeFilesAreLookedAtOnce) {
         FileSnapshotScope request;
         EXPECT_EQ(serials(), std::make_pair(std::string("FIRST"), std::string("FIRST")));
         ASSERT_TRUE(engineer.setObject("SerialNumber", Value("SECOND")));
-        writeFile(device, *toXmlPlist(Value(Value::Dictionary{{"SerialNumber", "SECOND"}})));
+        writeFile(device, *toXmlPlist(Value::Dictionary{{"SerialNumber", "SECOND"}}));
         EXPECT_EQ(serials(), std::make_pair(std::string("FIRST"), std::string("FIRST")));
         // The store's own writes are seen at once.
         ASSERT_TRUE(agent.setObject("SerialNumber", Value("OWN")));
@@ -169,14 +160,14 @@ TEST_F(FilePreferenceStoreTest, CorruptDomainIsReportedReadAsEmptyAndKeptUntilTh
         ASSERT_TRUE(store.setObject("SerialNumber", Value("C02NEW")));
         auto onDisk = parsePlist(readFile(path));
         ASSERT_TRUE(onDisk);
-        EXPECT_EQ(*onDisk, Value(Value::Dictionary{{"SerialNumber", Value("C02NEW")}}));
+        EXPECT_EQ(*onDisk, (Value::Dictionary{{"SerialNumber", Value("C02NEW")}}));
     }
 }
 
 TEST_F(FilePreferenceStoreTest, ValuesWithoutPropertyListFormAreRefused) {
     FilePreferenceStore store(path);
     ASSERT_TRUE(store.setObject("Keep", Value(1)));
-    EXPECT_FALSE(store.setObject("Bad", Value(Value::Array{Value(), Value(1)})));
+    EXPECT_FALSE(store.setObject("Bad", Value::Array{Value(), Value(1)}));
     EXPECT_FALSE(store.objectForKey("Bad"));
     EXPECT_EQ(store.integerForKey("Keep"), 1);
 }

@@ -11,6 +11,7 @@
 #include "core/AsioDispatcher.h"
 #include "core/JsonCodec.h"
 #include "core/PlistCodec.h"
+#include "fakes/Await.h"
 #include "fakes/FakeServices.h"
 #include "fakes/TestHttpsServer.h"
 #include "fakes/TestPlatform.h"
@@ -27,20 +28,20 @@ constexpr const char* kService = "com.velmora.kf.supportapp.auth";
 
 Value accountsFile(std::optional<std::string> tokenServiceURL,
                    std::optional<std::string> token = std::nullopt) {
-    Value::Dictionary kf{{"altDSID", "kf-alt"}, {"Tokens", Value(Value::Dictionary{})}};
+    Value::Dictionary kf{{"altDSID", "kf-alt"}, {"Tokens", Value::Dictionary{}}};
     if (token) {
         kf["Tokens"][kService] = Value(*token);
     }
     if (tokenServiceURL) {
         kf["TokenServiceURL"] = Value(*tokenServiceURL);
     }
-    return Value(Value::Dictionary{
+    return Value::Dictionary{
         {"PrimaryCloudAccount", Value(Value::Dictionary{{"altDSID", "primary-alt"}})},
         {"KFAccount", Value(std::move(kf))},
         {"StoreAccount",
          Value(Value::Dictionary{{"storefront", "143441-1,29"}, {"accountID", 42}})},
         {"IdentityHeaders", Value(Value::Dictionary{{"X-Extra", "yes"}, {"X-Number", 5}})},
-    });
+    };
 }
 
 struct Renewal {
@@ -50,18 +51,12 @@ struct Renewal {
 };
 
 Renewal renew(AccountStore& store, const Account& kf) {
-    auto promise = std::make_shared<std::promise<Renewal>>();
-    auto future = promise->get_future();
-    CredentialRenewalOptions options{true, {kService}};
-    store.renewCredentialsForAccount(
-        kf, options, [promise](long code, std::optional<std::string> error) {
-            promise->set_value({code, error, std::this_thread::get_id()});
-        });
-    if (future.wait_for(20s) != std::future_status::ready) {
-        ADD_FAILURE() << "renewal never completed";
-        return {};
-    }
-    return future.get();
+    return test::await<Renewal>([&](auto done) {
+        store.renewCredentialsForAccount(kf, {true, {kService}},
+                                         [done](long code, std::optional<std::string> error) {
+                                             done({code, error, std::this_thread::get_id()});
+                                         });
+    });
 }
 
 class HostAccountStoreTest : public ::testing::Test {
@@ -116,7 +111,7 @@ TEST_F(HostAccountStoreTest, AccountsFromTheFile) {
     EXPECT_NE(thread, std::this_thread::get_id());
 
     Value accounts = accountsFile(std::nullopt);
-    accounts["SilentAuthStoreAccount"] = Value(Value::Dictionary{{"storefront", "silent-front"}});
+    accounts["SilentAuthStoreAccount"] = Value::Dictionary{{"storefront", "silent-front"}};
     accounts.asDictionary()->erase("StoreAccount");
     accounts.asDictionary()->erase("KFAccount");
     write(accounts);
@@ -161,17 +156,10 @@ TEST_F(HostAccountStoreTest, RenewalWithoutTokenServiceMintsAndStoresAToken) {
 }
 
 TEST_F(HostAccountStoreTest, SigningRenewsThroughTheTokenService) {
-    // The handler's state is declared before the server so that it outlives the server's threads.
-    std::mutex mutex;
-    std::vector<std::string> bodies;
-    int calls = 0;
     test::TestHttpsServer server;
-    server.server().Post("/token", [&](const httplib::Request& req, httplib::Response& res) {
-        std::lock_guard lock(mutex);
-        bodies.push_back(req.body);
-        res.set_content(R"({"token":"server-token-)" + std::to_string(++calls) + "\"}",
-                        "application/json");
-    });
+    server.answer("/token", {});
+    server.queue("/token",
+                 {{200, R"({"token":"server-token-1"})"}, {200, R"({"token":"server-token-2"})"}});
     server.start();
     CurlHttpClient::Options options;
     options.extraCAFile = server.caFile();
@@ -187,13 +175,9 @@ TEST_F(HostAccountStoreTest, SigningRenewsThroughTheTokenService) {
     ASSERT_TRUE(qax_signWithAccountHeaders(request, *tp.platform, false, true, "com.example.app"));
     EXPECT_EQ(request.valueForHeader("X-Velmora-KF-Token"), "server-token-1");
     EXPECT_EQ(storedToken(), "server-token-1");
-    {
-        std::lock_guard lock(mutex);
-        ASSERT_EQ(bodies.size(), 1u);
-        EXPECT_EQ(parseJson(bodies[0]),
-                  Value(Value::Dictionary{{"altDSID", "kf-alt"},
-                                          {"services", Value(Value::Array{kService})}}));
-    }
+    ASSERT_EQ(server.requests().size(), 1u);
+    EXPECT_EQ(parseJson(server.requests()[0].body),
+              (Value::Dictionary{{"altDSID", "kf-alt"}, {"services", Value::Array{kService}}}));
     // A stored token needs no renewal unless forced.
     HttpRequest second("https://coverage.example/");
     ASSERT_TRUE(qax_signWithAccountHeaders(second, *tp.platform, false, true, "com.example.app"));
@@ -220,34 +204,26 @@ TEST_F(HostAccountStoreTest, SigningRenewsThroughTheTokenService) {
 
 TEST_F(HostAccountStoreTest, TokenServiceFailures) {
     test::TestHttpsServer server;
-    server.server().Post("/error",
-                         [](const httplib::Request&, httplib::Response& res) { res.status = 503; });
-    server.server().Post("/garbage", [](const httplib::Request&, httplib::Response& res) {
-        res.set_content("<html/>", "text/html");
-    });
-    server.server().Post("/empty", [](const httplib::Request&, httplib::Response& res) {
-        res.set_content(R"({"token":""})", "application/json");
-    });
+    server.answer("/error", {503});
+    server.answer("/garbage", {200, "<html/>", "text/html"});
+    server.answer("/empty", {200, R"({"token":""})"});
     server.start();
     CurlHttpClient::Options options;
     options.extraCAFile = server.caFile();
     auto http = std::make_shared<CurlHttpClient>(options);
-    struct Row {
-        std::string url;
-        long code;
-    } rows[] = {
+    const std::pair<std::string, long> rows[] = {
         {server.url("/error"), 503},
         {server.url("/garbage"), HostAccountStore::kRenewalBadAnswer},
         {server.url("/empty"), HostAccountStore::kRenewalBadAnswer},
         {"https://127.0.0.1:" + std::to_string(test::unusedLocalPort()) + "/token",
          HostAccountStore::kRenewalTransportError},
     };
-    for (const auto& row : rows) {
-        SCOPED_TRACE(row.url);
-        write(accountsFile(row.url, "kept"));
+    for (const auto& [url, code] : rows) {
+        SCOPED_TRACE(url);
+        write(accountsFile(url, "kept"));
         HostAccountStore store(tp.platform->platformRoot, http, dispatcher);
         auto result = renew(store, *store.kfAccountForCloudAccount(Account{}));
-        EXPECT_EQ(result.code, row.code);
+        EXPECT_EQ(result.code, code);
         EXPECT_TRUE(result.error && !result.error->empty());
         EXPECT_EQ(storedToken(), "kept");
     }

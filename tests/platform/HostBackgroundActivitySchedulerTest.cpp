@@ -102,35 +102,31 @@ class Harness {
 };
 
 TEST(HostBackgroundActivityScheduler, FiresAtItsDueTimeAndSurvivesARestart) {
-    struct Row {
-        const char* name;
-        double restartAfter;  // < 0: no restart
-        double attachAfter;   // after the restart: when the handler is attached again
-        double expectedFire;
-    } rows[] = {
+    // A restart (< 0: none), when the handler is attached again after it, the expected fire.
+    const std::tuple<const char*, double, double, double> rows[] = {
         {"no restart", -1, 0, 100},
         {"restart before due, attached at once", 40, 40, 100},
         {"restart before due, attached late", 40, 250, 250},
     };
-    for (const auto& r : rows) {
-        SCOPED_TRACE(r.name);
+    for (const auto& [name, restartAfter, attachAfter, expectedFire] : rows) {
+        SCOPED_TRACE(name);
         Harness h;
         std::vector<double> fires;
         h.schedule("x", 100, h.recorder(fires));
-        if (r.restartAfter >= 0) {
-            h.env.runner->advanceBy(r.restartAfter);
+        if (restartAfter >= 0) {
+            h.env.runner->advanceBy(restartAfter);
             h.restart();
-            h.env.runner->advanceBy(r.attachAfter - r.restartAfter);
+            h.env.runner->advanceBy(attachAfter - restartAfter);
             ASSERT_TRUE(fires.empty());
             h.attach("x", h.recorder(fires));
         }
-        if (r.expectedFire > h.elapsed()) {
-            h.env.runner->advanceBy(r.expectedFire - h.elapsed() - 0.5);
+        if (expectedFire > h.elapsed()) {
+            h.env.runner->advanceBy(expectedFire - h.elapsed() - 0.5);
             EXPECT_TRUE(fires.empty()) << "not before its due time";
         }
         h.env.runner->advanceBy(1000);
         ASSERT_EQ(fires.size(), 1u);
-        EXPECT_NEAR(fires[0], r.expectedFire, 0.01);
+        EXPECT_NEAR(fires[0], expectedFire, 0.01);
         auto record = h.record("x");
         EXPECT_FALSE(record.pending()) << "result 1 removes the registration";
         EXPECT_EQ(record.lastResult, 1);
@@ -138,12 +134,19 @@ TEST(HostBackgroundActivityScheduler, FiresAtItsDueTimeAndSurvivesARestart) {
     }
 }
 
-TEST(HostBackgroundActivityScheduler, DeferralsBackOffAndFiresStayAMinuteApart) {
+TEST(HostBackgroundActivityScheduler, DeferralsBackOffAcrossARestartAndFiresStayAMinuteApart) {
     Harness h;
     std::vector<double> fires;
-    h.schedule("x", 0, h.recorder(fires, [](std::size_t n) {
+    auto deferFifteenTimes = [](std::size_t n) {
         return n < 16 ? ActivityResult::Deferred : ActivityResult::Finished;
-    }));
+    };
+    h.schedule("x", 0, h.recorder(fires, deferFifteenTimes));
+    h.env.runner->advanceBy(4 * 60 + 1);  // fires at 0, 60, 120, 180, 240
+    ASSERT_EQ(fires.size(), 5u);
+    EXPECT_EQ(h.record("x").deferrals, 5);
+    // The count is persisted: the agent restarting changes no wait.
+    h.restart();
+    h.attach("x", h.recorder(fires, deferFifteenTimes));
     h.env.runner->advanceBy(48 * 3600);
     // Waits after each deferral: 5 s doubling (never under the 60 s spacing), at most 6 h.
     const double expectedGaps[] = {60,   60,   60,   60,    80,    160,   320,  640,
@@ -155,39 +158,22 @@ TEST(HostBackgroundActivityScheduler, DeferralsBackOffAndFiresStayAMinuteApart) 
     EXPECT_FALSE(h.record("x").pending());
 }
 
-TEST(HostBackgroundActivityScheduler, DeferralCountSurvivesARestart) {
-    Harness h;
-    std::vector<double> fires;
-    h.schedule("x", 0, h.recorder(fires, [](std::size_t) { return ActivityResult::Deferred; }));
-    h.env.runner->advanceBy(4 * 60 + 1);  // fires at 0, 60, 120, 180, 240
-    ASSERT_EQ(fires.size(), 5u);
-    EXPECT_EQ(h.record("x").deferrals, 5);
-    h.restart();
-    h.attach("x", h.recorder(fires, [](std::size_t) { return ActivityResult::Finished; }));
-    h.env.runner->advanceBy(3600);
-    ASSERT_EQ(fires.size(), 6u);
-    EXPECT_NEAR(fires[5] - fires[4], 80, 0.01) << "the wait after the fifth deferral is 80 s";
-}
-
 TEST(HostBackgroundActivityScheduler, RegistrationMadeDuringARunOutlivesItsResult) {
-    struct Row {
-        std::int64_t delayDuringRun;
-        double expectedSecondFire;
-    } rows[] = {{300, 300}, {0, 60}};
-    for (const auto& r : rows) {
-        SCOPED_TRACE(r.delayDuringRun);
+    const std::pair<std::int64_t, double> rows[] = {{300, 300}, {0, 60}};
+    for (const auto& [delayDuringRun, expectedSecondFire] : rows) {
+        SCOPED_TRACE(delayDuringRun);
         Harness h;
         std::vector<double> fires;
         h.schedule("x", 0, [&](Completion completion) {
             fires.push_back(h.elapsed());
             if (fires.size() == 1) {
-                h.schedule("x", r.delayDuringRun, h.recorder(fires));
+                h.schedule("x", delayDuringRun, h.recorder(fires));
             }
             completion(ActivityResult::Finished);
         });
         h.env.runner->advanceBy(3600);
         ASSERT_EQ(fires.size(), 2u);
-        EXPECT_NEAR(fires[1], r.expectedSecondFire, 0.01);
+        EXPECT_NEAR(fires[1], expectedSecondFire, 0.01);
         EXPECT_FALSE(h.record("x").pending());
     }
 }
@@ -246,26 +232,21 @@ TEST(HostBackgroundActivityScheduler, LaunchTriggersFireOncePerBootAndPerNewVers
         }
         h.env.runner->advanceBy(120);
     };
-    struct Step {
-        const char* name;
-        const char* bootId;
-        const char* version;
-        int boots, upgrades;
-    } steps[] = {
+    const std::tuple<const char*, const char*, const char*, int, int> steps[] = {
         {"first start", "boot-1", "4.2", 1, 1},
         {"restart, same boot", "boot-1", "4.2", 1, 1},
         {"reboot", "boot-2", "4.2", 2, 1},
         {"upgrade", "boot-2", "4.3", 2, 2},
         {"back to a version seen before", "boot-2", "4.2", 2, 2},
     };
-    for (const auto& s : steps) {
-        SCOPED_TRACE(s.name);
-        h.setBootId(s.bootId);
-        device.set("ProductVersion", Value(s.version));
+    for (const auto& [name, bootId, version, boots, upgrades] : steps) {
+        SCOPED_TRACE(name);
+        h.setBootId(bootId);
+        device.set("ProductVersion", Value(version));
         h.restart();
         attachAll();
-        EXPECT_EQ(count["boot"], s.boots);
-        EXPECT_EQ(count["upgrade"], s.upgrades);
+        EXPECT_EQ(count["boot"], boots);
+        EXPECT_EQ(count["upgrade"], upgrades);
     }
     // The interval activity fired on its first attach, then every hour of platform time.
     const int before = count["hourly"];

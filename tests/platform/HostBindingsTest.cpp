@@ -10,12 +10,7 @@ namespace qax {
 namespace {
 
 TEST(HostLocaleInfoTest, IdentifierFromEnvironment) {
-    struct Row {
-        const char* lcAll;
-        const char* lcMessages;
-        const char* lang;
-        const char* expected;
-    } rows[] = {
+    const std::tuple<const char*, const char*, const char*, const char*> rows[] = {
         {nullptr, nullptr, "fr_FR.UTF-8", "fr_FR"},
         {"de_DE.UTF-8", "fr_FR.UTF-8", "en_GB.UTF-8", "de_DE"},
         {"", "ja_JP.eucJP", "en_GB", "ja_JP"},
@@ -25,9 +20,8 @@ TEST(HostLocaleInfoTest, IdentifierFromEnvironment) {
         {"C.UTF-8", nullptr, nullptr, "en_US"},
         {nullptr, nullptr, nullptr, "en_US"},
     };
-    for (const auto& r : rows) {
-        EXPECT_EQ(HostLocaleInfo::identifierFromEnvironment(r.lcAll, r.lcMessages, r.lang),
-                  r.expected);
+    for (const auto& [lcAll, lcMessages, lang, expected] : rows) {
+        EXPECT_EQ(HostLocaleInfo::identifierFromEnvironment(lcAll, lcMessages, lang), expected);
     }
 }
 

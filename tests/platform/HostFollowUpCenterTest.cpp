@@ -59,7 +59,7 @@ TEST(HostFollowUpCenter, CodecKeepsEveryFieldAndWritesOptionsByName) {
     const auto decoded = FollowUpItemCodec::decode(*stored.asDictionary());
     EXPECT_EQ(FollowUpItemCodec::encode(decoded.item, decoded.postedDate), stored);
     EXPECT_EQ(*stored.find("notification")->find("options"),
-              Value(Value::Array{"LockScreen", "ExtensionForNotification"}));
+              (Value::Array{"LockScreen", "ExtensionForNotification"}));
     EXPECT_FALSE(stored.find("targetBundleIdentifier")) << "a missing text is a missing key";
     EXPECT_FALSE(stored.find("informativeFooterText"));
     // Milliseconds of the expiration date survive the binary store.
@@ -152,11 +152,11 @@ TEST(HostFollowUpCenter, StoredFilesTheAgentDidNotWrite) {
                       "com.velmora.Kestova.plist";
 
     // An item with mistyped keys is listed with what it has; other entries are passed over.
-    Value::Array odd{Value(Value::Dictionary{{"uniqueIdentifier", "x"},
-                                             {"title", 5},
-                                             {"displayStyle", "3"},
-                                             {"notification", "yes"},
-                                             {"informativeFooterText", "Footer"}}),
+    Value::Array odd{Value::Dictionary{{"uniqueIdentifier", "x"},
+                                       {"title", 5},
+                                       {"displayStyle", "3"},
+                                       {"notification", "yes"},
+                                       {"informativeFooterText", "Footer"}},
                      Value("not an item")};
     writeFile(path, *toXmlPlist(Value(odd)));
     auto items = center.pendingFollowUpItems(kClient, nullptr);

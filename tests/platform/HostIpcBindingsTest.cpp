@@ -66,7 +66,7 @@ TEST(IpcFrameCodecTest, LengthLimits) {
     }
     EXPECT_FALSE(IpcFrameCodec::frame(""));
     EXPECT_FALSE(IpcFrameCodec::frame(std::string(4 * 1024 * 1024 + 1, 'x')));
-    EXPECT_FALSE(IpcFrameCodec::encode(Value(Value::Array{Value()}))) << "a null has no plist form";
+    EXPECT_FALSE(IpcFrameCodec::encode(Value::Array{Value()})) << "a null has no plist form";
 }
 
 TEST(HostApplicationRegistryTest, ExecutablesMatchByFileIdentity) {
@@ -76,17 +76,17 @@ TEST(HostApplicationRegistryTest, ExecutablesMatchByFileIdentity) {
     test::writeFile(bin / "copy-of-settings", "#!/bin/true\n");
     std::filesystem::create_symlink(bin / "settings", bin / "link-to-settings");
     writePlist(dir.path() / "root/apps/settings.plist",
-               Value(Value::Dictionary{
+               Value::Dictionary{
                    {"BundleIdentifier", Value("com.velmora.Preferences")},
                    {"ExecutablePath", Value((bin / "settings").string())},
                    {"LocalizedName", Value("Settings")},
                    {"Installed", Value(true)},
                    {"Entitlements",
-                    Value(Value::Dictionary{{"com.velmora.private.qaxagent", Value(true)}})}}));
+                    Value(Value::Dictionary{{"com.velmora.private.qaxagent", Value(true)}})}});
     writePlist(dir.path() / "root/apps/support.plist",
-               Value(Value::Dictionary{{"BundleIdentifier", Value("com.velmora.support")},
-                                       {"VendorName", Value("Velmora")},
-                                       {"Installed", Value(false)}}));
+               Value::Dictionary{{"BundleIdentifier", Value("com.velmora.support")},
+                                 {"VendorName", Value("Velmora")},
+                                 {"Installed", Value(false)}});
     test::writeFile(dir.path() / "root/apps/broken.plist", "not a plist");
     test::writeFile(dir.path() / "root/apps/notes.txt", "ignored");
 
@@ -111,7 +111,7 @@ TEST(HostApplicationRegistryTest, ExecutablesMatchByFileIdentity) {
 
     // Files are read afresh: removing the entitlement takes effect on the next look-up.
     writePlist(dir.path() / "root/apps/settings.plist",
-               Value(Value::Dictionary{{"ExecutablePath", Value((bin / "settings").string())}}));
+               Value::Dictionary{{"ExecutablePath", Value((bin / "settings").string())}});
     EXPECT_TRUE(registry.entitlementsForExecutablePath((bin / "settings").string()).empty());
 }
 
@@ -123,7 +123,7 @@ TEST(HostPlatformFilesTest, PairedDevicesAndFeatureFlags) {
     EXPECT_FALSE(flags.isFeatureEnabled("Kestova", "Tessel_3_0"));
 
     writePlist(root.path() / "paired-devices.plist",
-               Value(Value::Array{
+               Value::Array{
                    Value(Value::Dictionary{{"name", Value("W")},
                                            {"serialNumber", Value("S1")},
                                            {"pairedDate", Value(Date(1.6e9))},
@@ -131,7 +131,7 @@ TEST(HostPlatformFilesTest, PairedDevicesAndFeatureFlags) {
                                            {"isAltAccount", Value(true)}}),
                    Value("not a device"),
                    Value(Value::Dictionary{{"name", Value(42)}, {"isArchived", Value(true)}}),
-               }));
+               });
     auto all = registry.allDevicesMatching(nullptr);
     ASSERT_EQ(all.size(), 2u);
     EXPECT_EQ(all[0].serialNumber, "S1");
@@ -141,11 +141,10 @@ TEST(HostPlatformFilesTest, PairedDevicesAndFeatureFlags) {
     EXPECT_EQ(
         registry.allDevicesMatching([](const PairedDevice& d) { return d.isArchived; }).size(), 1u);
 
-    writePlist(
-        root.path() / "features.plist",
-        Value(Value::Dictionary{{"Kestova", Value(Value::Dictionary{{"Tessel_3_0", Value(true)},
-                                                                    {"Other", Value(false)},
-                                                                    {"Text", Value("YES")}})}}));
+    writePlist(root.path() / "features.plist",
+               Value::Dictionary{{"Kestova", Value(Value::Dictionary{{"Tessel_3_0", Value(true)},
+                                                                     {"Other", Value(false)},
+                                                                     {"Text", Value("YES")}})}});
     EXPECT_TRUE(flags.isFeatureEnabled("Kestova", "Tessel_3_0"));
     EXPECT_FALSE(flags.isFeatureEnabled("Kestova", "Other"));
     EXPECT_FALSE(flags.isFeatureEnabled("Kestova", "Text"));
@@ -188,22 +187,21 @@ TEST(HostUnixSocketPathTest, ClaimsFreeAndStalePathsButNotLiveOnes) {
 TEST(HostNotificationSocketTest, DeliversNamesToEverySubscriber) {
     test::TempDir dir;
     HostNotificationSocket socket(dir.str());
-    std::promise<std::optional<std::string>> first, second;
-    auto id1 =
-        socket.subscribe([&first](const std::optional<std::string>& n) { first.set_value(n); });
-    auto id2 =
-        socket.subscribe([&second](const std::optional<std::string>& n) { second.set_value(n); });
-    ASSERT_NE(id1, 0u);
-    ASSERT_NE(id2, 0u);
+    std::promise<std::optional<std::string>> heard[2];
+    std::vector<std::uint64_t> ids;
+    for (auto& promise : heard) {
+        ids.push_back(socket.subscribe([&promise](const auto& n) { promise.set_value(n); }));
+        ASSERT_NE(ids.back(), 0u);
+    }
     ASSERT_TRUE(HostNotificationSocket::post(dir.str(), "com.velmora.language.changed"));
-    auto f1 = first.get_future();
-    auto f2 = second.get_future();
-    ASSERT_EQ(f1.wait_for(std::chrono::seconds(5)), std::future_status::ready);
-    ASSERT_EQ(f2.wait_for(std::chrono::seconds(5)), std::future_status::ready);
-    EXPECT_EQ(f1.get(), "com.velmora.language.changed");
-    EXPECT_EQ(f2.get(), "com.velmora.language.changed");
-    socket.unsubscribe(id1);
-    socket.unsubscribe(id2);
+    for (auto& promise : heard) {
+        auto name = promise.get_future();
+        ASSERT_EQ(name.wait_for(std::chrono::seconds(5)), std::future_status::ready);
+        EXPECT_EQ(name.get(), "com.velmora.language.changed");
+    }
+    for (auto id : ids) {
+        socket.unsubscribe(id);
+    }
 }
 
 }  // namespace

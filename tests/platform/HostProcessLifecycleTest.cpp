@@ -26,14 +26,9 @@ struct Harness {
 };
 
 TEST(HostProcessLifecycleTest, ExitsOnlyWhenStartedOnDemandAndNothingIsOpen) {
-    struct Row {
-        const char* name;
-        bool onDemand;
-        std::vector<const char*> open;  // transactions still held
-        bool cleanExit;
-        double after;  // seconds of virtual time
-        bool exits;
-    } rows[] = {
+    // Started on demand, the transactions still held, a clean-exit request, the virtual seconds
+    // waited, and whether the main loop is ended.
+    const std::tuple<const char*, bool, std::vector<const char*>, bool, double, bool> rows[] = {
         {"idle, not yet 60 s", true, {}, false, 59.9, false},
         {"idle for 60 s", true, {}, false, 60, true},
         {"client connected", true, {"client connection"}, false, 3600, false},
@@ -49,19 +44,19 @@ TEST(HostProcessLifecycleTest, ExitsOnlyWhenStartedOnDemandAndNothingIsOpen) {
         {"started by hand, idle", false, {}, false, 3600, false},
         {"started by hand, clean exit", false, {}, true, 3600, false},
     };
-    for (const auto& row : rows) {
-        SCOPED_TRACE(row.name);
-        Harness h(row.onDemand);
+    for (const auto& [name, onDemand, open, cleanExit, after, exits] : rows) {
+        SCOPED_TRACE(name);
+        Harness h(onDemand);
         std::vector<std::shared_ptr<void>> held;
-        for (const char* reason : row.open) {
+        for (const char* reason : open) {
             held.push_back(h.lifecycle->beginTransaction(reason));
         }
-        if (row.cleanExit) {
+        if (cleanExit) {
             h.lifecycle->requestCleanExit();
         }
-        h.env.runner->advanceBy(row.after);
-        EXPECT_EQ(h.exits, row.exits ? 1 : 0);
-        if (!row.onDemand && row.cleanExit) {
+        h.env.runner->advanceBy(after);
+        EXPECT_EQ(h.exits, exits ? 1 : 0);
+        if (!onDemand && cleanExit) {
             EXPECT_EQ(h.env.log->countContaining("it keeps running"), 1);
         }
     }

@@ -39,12 +39,7 @@ int errorCount(const test::TestPlatform& env) {
 }
 
 TEST(SimulatedClock, OffsetFromTheClockFile) {
-    struct Row {
-        const char* name;
-        std::optional<std::string> file;
-        double offset;
-        bool logged;
-    } rows[] = {
+    const std::tuple<const char*, std::optional<std::string>, double, bool> rows[] = {
         {"absent", std::nullopt, 0, false},
         {"no key", xmlPlist("<dict/>"), 0, false},
         {"integer", xmlPlist("<dict><key>OffsetSeconds</key><integer>86400</integer></dict>"),
@@ -58,17 +53,17 @@ TEST(SimulatedClock, OffsetFromTheClockFile) {
         {"root is an array", xmlPlist("<array><real>5</real></array>"), 0, true},
         {"empty", std::string(), 0, true},
     };
-    for (const auto& r : rows) {
-        SCOPED_TRACE(r.name);
+    for (const auto& [name, file, offset, logged] : rows) {
+        SCOPED_TRACE(name);
         test::TestPlatform env;
         const std::string root = env.platform->platformRoot;
-        if (r.file) {
-            writeFile(SimulatedClock::clockFilePath(root), *r.file);
+        if (file) {
+            writeFile(SimulatedClock::clockFilePath(root), *file);
         }
         SimulatedClock clock(root, env.clock);
-        EXPECT_EQ(clock.offsetSeconds(), r.offset);
-        EXPECT_EQ(clock.now(), env.clock->now().byAdding(r.offset));
-        EXPECT_EQ(errorCount(env), r.logged ? 1 : 0);
+        EXPECT_EQ(clock.offsetSeconds(), offset);
+        EXPECT_EQ(clock.now(), env.clock->now().byAdding(offset));
+        EXPECT_EQ(errorCount(env), logged ? 1 : 0);
     }
 
     test::TestPlatform env;
@@ -177,13 +172,13 @@ TEST(HostAnalyticsSink, AppendsEventsUnlessTurnedOff) {
     int built = 0;
     auto payload = [&] {
         ++built;
-        return Value(Value::Dictionary{{"devicetype", "Watch"}});
+        return Value::Dictionary{{"devicetype", "Watch"}};
     };
     sink.sendEventLazily("com.velmora.kestova.followupDisplayCount", payload);
     EXPECT_EQ(parseJson(readFile(HostAnalyticsSink::eventsPath(root.str()))),
-              Value(Value::Dictionary{{"time", "2023-11-14T22:13:20.000Z"},
-                                      {"event", "com.velmora.kestova.followupDisplayCount"},
-                                      {"payload", Value::Dictionary{{"devicetype", "Watch"}}}}));
+              (Value::Dictionary{{"time", "2023-11-14T22:13:20.000Z"},
+                                 {"event", "com.velmora.kestova.followupDisplayCount"},
+                                 {"payload", Value::Dictionary{{"devicetype", "Watch"}}}}));
     writeFile(root.path() / "analytics.plist", xmlPlist("<dict><key>Enabled</key><false/></dict>"));
     sink.sendEventLazily("e", payload);
     EXPECT_EQ(built, 1) << "the payload is never built while the sink is off";
@@ -225,12 +220,7 @@ TEST(HostUserInterfaceStrings, LanguageFallbacks) {
     table("de", "not a table");
     auto locale = std::make_shared<test::FakeLocaleInfo>();
     HostUserInterfaceStrings strings(share.str(), locale);
-    struct Row {
-        const char* locale;
-        const char* key;
-        const char* table;
-        const char* expected;
-    } rows[] = {
+    const std::tuple<const char*, const char*, const char*, const char*> rows[] = {
         {"fr_FR", "DETAILS", "Localizable", "Détails"},
         {"fr_CA", "DETAILS", "Localizable", "Détails (CA)"},
         {"fr_FR", "ONLY_EN", "Localizable", "English only"},
@@ -241,10 +231,10 @@ TEST(HostUserInterfaceStrings, LanguageFallbacks) {
         {"fr_FR", "DETAILS", "Other", "default"},
         {"fr_FR", "DETAILS", "../fr.lproj/Localizable", "default"},
     };
-    for (const auto& r : rows) {
-        locale->identifier = r.locale;
-        EXPECT_EQ(strings.localizedString(r.key, "default", r.table), r.expected)
-            << r.locale << " " << r.key << " " << r.table;
+    for (const auto& [language, key, tableName, expected] : rows) {
+        locale->identifier = language;
+        EXPECT_EQ(strings.localizedString(key, "default", tableName), expected)
+            << language << " " << key << " " << tableName;
     }
 }
 

@@ -3,12 +3,11 @@
 // Good answers are checked against coverage-sim (CoverageSimScenarioTest).
 #include <gtest/gtest.h>
 
-#include <chrono>
-#include <future>
 #include <thread>
 
 #include "core/AsioDispatcher.h"
 #include "core/PlistCodec.h"
+#include "fakes/Await.h"
 #include "fakes/TestHttpsServer.h"
 #include "fakes/TestPlatform.h"
 #include "platform/host/CurlHttpClient.h"
@@ -17,8 +16,6 @@
 
 namespace qax {
 namespace {
-
-using namespace std::chrono_literals;
 
 template <typename Record>
 struct Answer {
@@ -29,33 +26,23 @@ struct Answer {
 
 template <typename Record, typename Ask>
 Answer<Record> wait(Ask ask) {
-    auto promise = std::make_shared<std::promise<Answer<Record>>>();
-    auto future = promise->get_future();
-    ask([promise](std::vector<Record> records, std::optional<std::string> error) {
-        promise->set_value({std::move(records), std::move(error), std::this_thread::get_id()});
+    return test::await<Answer<Record>>([&](auto done) {
+        ask([done](std::vector<Record> records, std::optional<std::string> error) {
+            done({std::move(records), std::move(error), std::this_thread::get_id()});
+        });
     });
-    if (future.wait_for(20s) != std::future_status::ready) {
-        ADD_FAILURE() << "no completion";
-        return {};
-    }
-    return future.get();
 }
 
 TEST(HostStoreBindings, FailuresCompleteOnceWithAReason) {
     test::TestHttpsServer server;
-    auto answer = [&](const char* path, int status, std::string body) {
-        server.server().Get(path, [status, body](const httplib::Request&, httplib::Response& res) {
-            res.status = status;
-            res.set_content(body, "application/json");
-        });
-    };
-    answer("/empty", 200, R"({"results":[],"purchases":[]})");
-    answer("/status", 503, R"({"results":[],"purchases":[]})");
-    answer("/garbage", 200, "<html>nope</html>");
-    answer("/object", 200, R"({"results":{},"purchases":"none"})");
-    answer("/array", 200, R"([{"results":[]}])");
-    answer("/bad-item", 200, R"({"results":[5],"purchases":[7]})");
-    answer("/bad-field", 200, R"({"results":[{"artworkURLs":"x"}],"purchases":[{"title":5}]})");
+    server.answer("/empty", {200, R"({"results":[],"purchases":[]})"});
+    server.answer("/status", {503, R"({"results":[],"purchases":[]})"});
+    server.answer("/garbage", {200, "<html>nope</html>"});
+    server.answer("/object", {200, R"({"results":{},"purchases":"none"})"});
+    server.answer("/array", {200, R"([{"results":[]}])"});
+    server.answer("/bad-item", {200, R"({"results":[5],"purchases":[7]})"});
+    server.answer("/bad-field",
+                  {200, R"({"results":[{"artworkURLs":"x"}],"purchases":[{"title":5}]})"});
     server.start();
     CurlHttpClient::Options options;
     options.extraCAFile = server.caFile();
@@ -69,17 +56,13 @@ TEST(HostStoreBindings, FailuresCompleteOnceWithAReason) {
             return;
         }
         test::writeFile(
-            path,
-            *toXmlPlist(Value(Value::Dictionary{{"LookupURL", *url}, {"PurchasesURL", *url}})));
+            path, *toXmlPlist(Value::Dictionary{{"LookupURL", *url}, {"PurchasesURL", *url}}));
     };
 
     const std::string unreachable =
         "https://127.0.0.1:" + std::to_string(test::unusedLocalPort()) + "/lookup";
-    struct Row {
-        std::optional<std::string> url;  // none: no store.plist
-        const char* lookupReason;
-        const char* purchasesReason;
-    } rows[] = {
+    // The URL in store.plist (none: no file) and what each binding's reason says.
+    const std::tuple<std::optional<std::string>, const char*, const char*> rows[] = {
         {std::nullopt, "names no LookupURL", "names no PurchasesURL"},
         {"ftp://127.0.0.1/lookup", "is not an http(s) URL", "is not an http(s) URL"},
         {"not a url", "is not an http(s) URL", "is not an http(s) URL"},
@@ -95,13 +78,13 @@ TEST(HostStoreBindings, FailuresCompleteOnceWithAReason) {
     };
     HostStoreLookup lookup(root.path().string(), http, dispatcher);
     HostPurchaseHistory purchases(root.path().string(), http, dispatcher);
-    for (const auto& row : rows) {
-        SCOPED_TRACE(row.url.value_or("no store.plist"));
-        storeFile(row.url);
+    for (const auto& [url, lookupReason, purchasesReason] : rows) {
+        SCOPED_TRACE(url.value_or("no store.plist"));
+        storeFile(url);
         auto found = wait<StoreItem>(
             [&](auto done) { lookup.lookUpBundleIdentifier("x", std::move(done)); });
         ASSERT_TRUE(found.error);
-        EXPECT_NE(found.error->find(row.lookupReason), std::string::npos) << *found.error;
+        EXPECT_NE(found.error->find(lookupReason), std::string::npos) << *found.error;
         EXPECT_EQ(found.error->rfind("store look-up: ", 0), 0u) << *found.error;
         EXPECT_TRUE(found.records.empty());
         EXPECT_NE(found.thread, std::this_thread::get_id());
@@ -109,7 +92,7 @@ TEST(HostStoreBindings, FailuresCompleteOnceWithAReason) {
         auto bought = wait<PurchaseRecord>(
             [&](auto done) { purchases.purchasesForAccount(0, {"x"}, std::move(done)); });
         ASSERT_TRUE(bought.error);
-        EXPECT_NE(bought.error->find(row.purchasesReason), std::string::npos) << *bought.error;
+        EXPECT_NE(bought.error->find(purchasesReason), std::string::npos) << *bought.error;
         EXPECT_TRUE(bought.records.empty());
     }
 

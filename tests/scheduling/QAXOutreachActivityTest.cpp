@@ -12,6 +12,7 @@
 #include "fakes/FixedDeviceProvider.h"
 #include "fakes/TestPlatform.h"
 #include "platform/TelephonyInfo.h"
+#include "scheduling/QAXOutreachActivity.h"
 #include "scheduling/QAXOutreachActivityUtilities.h"
 #include "scheduling/QAXScheduler.h"
 #include "warranty/QAXWarranty.h"
@@ -48,10 +49,10 @@ class OutreachTest : public ::testing::Test {
     }
     std::shared_ptr<QAXWarranty> warranty(const Download& d) {
         Value::Array toggle(d.toggle.begin(), d.toggle.end());
-        Value::Dictionary summary{{"featureToggleParameters",
-                                   Value(Value::Dictionary{{"hvOfferDisplay", d.displayed},
-                                                           {"hvOfferDurationDaysBeforeEndDate", 30},
-                                                           {"hvOfferToggle", Value(toggle)}})}};
+        Value::Dictionary summary{
+            {"featureToggleParameters", Value::Dictionary{{"hvOfferDisplay", d.displayed},
+                                                          {"hvOfferDurationDaysBeforeEndDate", 30},
+                                                          {"hvOfferToggle", Value(toggle)}}}};
         for (auto [key, days] : {std::pair{"hvOfferFollowupDisplayDate", d.display},
                                  std::pair{"hvOfferEligibleUntil", d.until}}) {
             if (days) {
@@ -111,17 +112,11 @@ class OutreachTest : public ::testing::Test {
     // Starts a run; what it reports is collected in the returned list.
     std::shared_ptr<std::vector<std::int64_t>> start(
         const std::shared_ptr<QAXOutreachActivityUtilities>& utilities, bool conversion) {
-        struct Activity : QAXSchedulerActivityDelegate {
-            std::string identifier() const override { return kQAXOutreachActivityIdentifier; }
-            bool requiresNetwork() const override { return true; }
-            void performActivityForScheduler(const std::shared_ptr<QAXScheduler>&,
-                                             Completion) override {}
-        };
         auto results = std::make_shared<std::vector<std::int64_t>>();
         utilities->performOutreachActivityForConversion(
             conversion,
-            QAXScheduler::newSchedulerWithActivityDelegate(tp.platform,
-                                                           std::make_shared<Activity>()),
+            QAXScheduler::newSchedulerWithActivityDelegate(
+                tp.platform, std::make_shared<QAXOutreachActivity>(tp.platform)),
             [results](std::int64_t r) { results->push_back(r); });
         return results;
     }
@@ -130,9 +125,11 @@ class OutreachTest : public ::testing::Test {
         joinThreads();
         tp.runner->runUntilIdle();
     }
+    std::vector<test::FakeAgentFactory::Scheduling> made() {
+        return static_cast<test::FakeAgentFactory&>(*tp.platform->agentFactory).schedulings();
+    }
     std::optional<Date> scheduledPost(std::size_t before) {
-        const auto made =
-            static_cast<test::FakeAgentFactory&>(*tp.platform->agentFactory).schedulings();
+        const auto made = this->made();
         EXPECT_LE(made.size(), before + 1);
         if (made.size() == before) {
             return std::nullopt;
@@ -140,11 +137,7 @@ class OutreachTest : public ::testing::Test {
         EXPECT_EQ(made.back().identifier, kQAXFollowUpPostActivityIdentifier);
         return made.back().date;
     }
-    std::size_t schedulings() {
-        return static_cast<test::FakeAgentFactory&>(*tp.platform->agentFactory)
-            .schedulings()
-            .size();
-    }
+    std::size_t schedulings() { return made().size(); }
 
     test::TestPlatform tp;
     std::shared_ptr<FixedTelephony> telephony = std::make_shared<FixedTelephony>();

@@ -58,36 +58,30 @@ class QAXSchedulerTest : public ::testing::Test {
 
 TEST_F(QAXSchedulerTest, DelayIsClampedAndTruncatedToWholeSeconds) {
     const double inf = std::numeric_limits<double>::infinity();
-    struct Row {
-        double delay;
-        std::int64_t delaySeconds;
-        std::int64_t grace;
-        bool targetIsNowPlusDelay;
-    };
-    const Row rows[] = {
+    const std::tuple<double, std::int64_t, std::int64_t, bool> rows[] = {
         {25, 25, 2, true},  {9.9, 9, 0, true},   {3600, 3600, 360, true},
         {0, 0, 0, true},    {-30, 0, 0, true},   {std::nan(""), 0, 0, false},
         {inf, 0, 0, false}, {-inf, 0, 0, false},
     };
-    for (const Row& row : rows) {
-        SCOPED_TRACE(row.delay);
-        const bool network = row.delaySeconds % 2 == 0;
+    for (const auto& [delay, delaySeconds, grace, targetIsNowPlusDelay] : rows) {
+        SCOPED_TRACE(delay);
+        const bool network = delaySeconds % 2 == 0;
         auto scheduler = make(std::make_shared<RecordingActivity>(network));
-        scheduler->scheduleActivityWithDelay(row.delay);
+        scheduler->scheduleActivityWithDelay(delay);
 
-        auto criteria = activity()->criteria();
+        auto criteria = activity()->told().criteria;
         ASSERT_TRUE(criteria);
-        EXPECT_EQ(criteria->delaySeconds, row.delaySeconds);
-        EXPECT_EQ(criteria->gracePeriodSeconds, row.grace);
+        EXPECT_EQ(criteria->delaySeconds, delaySeconds);
+        EXPECT_EQ(criteria->gracePeriodSeconds, grace);
         EXPECT_EQ(criteria->requiresNetwork, network);
         EXPECT_TRUE(criteria->priorityUtility);
-        EXPECT_FALSE(activity()->preregistered());
-        EXPECT_FALSE(activity()->repeats());
-        EXPECT_EQ(activity()->qualityOfService(), QualityOfService::Background);
+        EXPECT_FALSE(activity()->told().preregistered);
+        EXPECT_FALSE(activity()->told().repeats);
+        EXPECT_EQ(activity()->told().qualityOfService, QualityOfService::Background);
         EXPECT_TRUE(activity()->armed());
 
         const Date now = tp.clock->now();
-        const Date expected = row.targetIsNowPlusDelay ? now.byAdding(row.delay) : now;
+        const Date expected = targetIsNowPlusDelay ? now.byAdding(delay) : now;
         EXPECT_EQ(scheduler->scheduledActivityDate(), expected);
     }
 }
@@ -97,63 +91,59 @@ TEST_F(QAXSchedulerTest, ScheduleForDateSetsOrRemovesTheTarget) {
     const Date past = tp.clock->now().byAdding(-86400);
     scheduler->scheduleActivityForDate(past);
     EXPECT_EQ(scheduler->scheduledActivityDate(), past);
-    EXPECT_EQ(activity()->criteria()->delaySeconds, 0);
+    EXPECT_EQ(activity()->told().criteria->delaySeconds, 0);
     EXPECT_TRUE(
         tp.log->contains("scheduled 'com.velmora.qaxagent.outreach' with delay: "
                          "-86400.00 (" +
                          past.description() + ")"));
 
     scheduler->scheduleActivityForDate(tp.clock->now().byAdding(90.5));
-    EXPECT_EQ(activity()->criteria()->delaySeconds, 90);
-    EXPECT_EQ(activity()->criteria()->gracePeriodSeconds, 9);
+    EXPECT_EQ(activity()->told().criteria->delaySeconds, 90);
+    EXPECT_EQ(activity()->told().criteria->gracePeriodSeconds, 9);
 
     // No date: run at the first opportunity and leave no target behind.
     scheduler->scheduleActivityForDate(std::nullopt);
     EXPECT_FALSE(hasTarget());
-    EXPECT_EQ(activity()->criteria()->delaySeconds, 0);
+    EXPECT_EQ(activity()->told().criteria->delaySeconds, 0);
     EXPECT_TRUE(
         tp.log->contains("scheduled 'com.velmora.qaxagent.outreach' with delay: 0.00 ((null))"));
 }
 
 TEST_F(QAXSchedulerTest, FiringDecidesByTheStoredTarget) {
-    struct Row {
-        const char* name;
-        std::optional<double> targetFromNow;
-        std::optional<std::int64_t> delegateResult;  // none: the run is deferred unrun
-        ActivityResult handedBack;
-        bool targetKept;
-    };
-    const Row rows[] = {
-        {"ten minutes early", 600, std::nullopt, ActivityResult::Deferred, true},
-        {"exactly at target, finished", 0, QAXActivityResultFinished, ActivityResult::Finished,
-         false},
-        {"late, finished", -5, QAXActivityResultFinished, ActivityResult::Finished, false},
-        {"late, deferred by the run", -5, QAXActivityResultDeferred, ActivityResult::Deferred,
-         true},
-        {"no target", std::nullopt, QAXActivityResultFinished, ActivityResult::Finished, false},
-    };
-    for (const Row& row : rows) {
-        SCOPED_TRACE(row.name);
+    // The target, what the run reports (none: the run is deferred unrun), what the platform hears.
+    const std::tuple<const char*, std::optional<double>, std::optional<std::int64_t>,
+                     ActivityResult, bool>
+        rows[] = {
+            {"ten minutes early", 600, std::nullopt, ActivityResult::Deferred, true},
+            {"exactly at target, finished", 0, QAXActivityResultFinished, ActivityResult::Finished,
+             false},
+            {"late, finished", -5, QAXActivityResultFinished, ActivityResult::Finished, false},
+            {"late, deferred by the run", -5, QAXActivityResultDeferred, ActivityResult::Deferred,
+             true},
+            {"no target", std::nullopt, QAXActivityResultFinished, ActivityResult::Finished, false},
+        };
+    for (const auto& [name, targetFromNow, delegateResult, handedBack, targetKept] : rows) {
+        SCOPED_TRACE(name);
         auto run = std::make_shared<RecordingActivity>();
         auto scheduler = make(run);
-        if (row.targetFromNow) {
-            scheduler->scheduleActivityWithDelay(*row.targetFromNow);
+        if (targetFromNow) {
+            scheduler->scheduleActivityWithDelay(*targetFromNow);
         } else {
             scheduler->scheduleActivityForDate(std::nullopt);
         }
         const auto before = activity()->results().size();
         ASSERT_TRUE(activity()->fire());
-        if (row.delegateResult) {
+        if (delegateResult) {
             EXPECT_EQ(run->runs, 1);
             ASSERT_TRUE(run->pending);
-            run->pending(*row.delegateResult);
+            run->pending(*delegateResult);
         } else {
             EXPECT_EQ(run->runs, 0);
             EXPECT_TRUE(tp.log->contains(
                 "target not past for 'com.velmora.qaxagent.outreach', defer for: 600.00"));
         }
-        EXPECT_EQ(hasTarget(), row.targetKept);
-        if (!row.targetKept) {
+        EXPECT_EQ(hasTarget(), targetKept);
+        if (!targetKept) {
             EXPECT_FALSE(scheduler->scheduledActivityDate());
         }
 
@@ -162,14 +152,14 @@ TEST_F(QAXSchedulerTest, FiringDecidesByTheStoredTarget) {
         EXPECT_EQ(activity()->results().size(), before);
         tp.runner->advanceBy(0.001);
         ASSERT_EQ(activity()->results().size(), before + 1);
-        EXPECT_EQ(activity()->results().back(), row.handedBack);
+        EXPECT_EQ(activity()->results().back(), handedBack);
     }
 }
 
 TEST_F(QAXSchedulerTest, MonitoringAttachesToThePreregisteredActivity) {
     auto scheduler = make(delegate);
     scheduler->monitorForScheduledActivity();
-    EXPECT_TRUE(activity()->preregistered());
+    EXPECT_TRUE(activity()->told().preregistered);
 
     // A wake-up of the pre-registered activity with a target still in the future defers.
     tp.platform->preferences->setObject(QAXScheduler::targetDateKey(kIdentifier),
@@ -192,7 +182,7 @@ TEST_F(QAXSchedulerTest, RunThatReschedulesItselfAndFinishesLosesTheNewTarget) {
     };
     activity()->fire();
     ASSERT_TRUE(hasTarget());
-    EXPECT_EQ(activity()->criteria()->delaySeconds, 3600);
+    EXPECT_EQ(activity()->told().criteria->delaySeconds, 3600);
 
     delegate->duringRun = nullptr;
     delegate->pending(QAXActivityResultFinished);
@@ -217,7 +207,7 @@ TEST_F(QAXSchedulerTest, ClearRemovesOnlyTargetDates) {
     prefs.setObject("something.else.TargetDate", Value(tp.clock->now()));
     prefs.setObject("TargetDate", Value(1));
     prefs.setObject("com.velmora.qaxagent.outreach.TargetDate.old", Value(1));
-    prefs.setObject("FollowupPostedSerialNumberHashes", Value(Value::Array{"abc"}));
+    prefs.setObject("FollowupPostedSerialNumberHashes", Value::Array{"abc"});
 
     QAXScheduler::clearScheduledActivities(*tp.platform);
 

@@ -21,24 +21,7 @@ using test::FakeIdentityAccountManager;
 constexpr const char* kNoTokenAfterRenewal =
     "Error: still no KF token even after calling renewCredentialsForAccount.";
 
-class AccountHeadersTest : public ::testing::Test {
-  protected:
-    AccountHeadersTest() {
-        accounts = std::make_shared<FakeAccountStore>();
-        tp.platform->accounts = accounts;
-        tp.platform->identity = std::make_shared<FakeIdentityAccountManager>();
-    }
-
-    bool sign(bool force = false, std::optional<std::string> bundleID = "com.velmora.Preferences") {
-        return qax_signWithAccountHeaders(request, *tp.platform, force, true, bundleID);
-    }
-
-    test::TestPlatform tp;
-    std::shared_ptr<FakeAccountStore> accounts;
-    HttpRequest request{"https://coverage.example/api/v3/coverage/summary", 30};
-};
-
-// A platform of its own for one table row, signed in as the fake account store is.
+// A platform signed in as the fake account store is.
 struct Local {
     Local() {
         tp.platform->accounts = store;
@@ -46,7 +29,15 @@ struct Local {
     }
     test::TestPlatform tp;
     std::shared_ptr<FakeAccountStore> store = std::make_shared<FakeAccountStore>();
-    HttpRequest request{"https://coverage.example/"};
+    HttpRequest request{"https://coverage.example/api/v3/coverage/summary", 30};
+};
+
+class AccountHeadersTest : public ::testing::Test, protected Local {
+  protected:
+    bool sign(bool force = false, std::optional<std::string> bundleID = "com.velmora.Preferences") {
+        return qax_signWithAccountHeaders(request, *tp.platform, force, true, bundleID);
+    }
+    std::shared_ptr<FakeAccountStore>& accounts = store;
 };
 
 TEST_F(AccountHeadersTest, SignedRequestCarriesEveryHeaderInOrder) {
@@ -196,12 +187,7 @@ TEST_F(AccountHeadersTest, StoreFront) {
 }
 
 TEST_F(AccountHeadersTest, CoverageBody) {
-    struct Row {
-        double now;
-        int secondsFromGMT;
-        std::uint64_t timestamp;
-        int timezone;
-    } rows[] = {
+    const std::tuple<double, int, std::uint64_t, int> rows[] = {
         {1700000000.9999, 0, 1700000000999ULL, 0},
         {1700000000.0, 5 * 3600 + 1800, 1700000000000ULL, 5},      // +5:30
         {1700000000.0, -(3 * 3600 + 1800), 1700000000000ULL, -3},  // -3:30
@@ -209,18 +195,18 @@ TEST_F(AccountHeadersTest, CoverageBody) {
         {1700000000.0, -(9 * 3600 + 1800), 1700000000000ULL, -9},  // -9:30
         {1700000000.5, -8 * 3600, 1700000000500ULL, -8},
     };
-    for (const auto& row : rows) {
-        SCOPED_TRACE(row.secondsFromGMT);
-        tp.clock->set(Date(row.now));
-        tp.clock->setSecondsFromGMT(row.secondsFromGMT);
+    for (const auto& [now, secondsFromGMT, timestamp, timezone] : rows) {
+        SCOPED_TRACE(secondsFromGMT);
+        tp.clock->set(Date(now));
+        tp.clock->setSecondsFromGMT(secondsFromGMT);
         HttpRequest r("https://coverage.example/");
         qax_setCoverageRequestBodyWithSerialNumber(r, *tp.platform, "C02SERIAL");
         EXPECT_EQ(r.method(), "POST");
         EXPECT_EQ(r.valueForHeader("Content-Type"), "application/json");
         // Compact JSON with integer numbers, keys in order.
         EXPECT_EQ(bodyDescription(r), R"({"locale":"en_US","requestTimestamp":)" +
-                                          std::to_string(row.timestamp) + R"(,"requestTimezone":)" +
-                                          std::to_string(row.timezone) +
+                                          std::to_string(timestamp) + R"(,"requestTimezone":)" +
+                                          std::to_string(timezone) +
                                           R"(,"serialNumber":"C02SERIAL"})");
     }
 }

@@ -149,6 +149,23 @@ TEST_F(QAXKVAManagerTest, HeadersCarryAVerifiableSignatureAndChain) {
     addKVAAuthenticationHeadersWithBody(request, *tp.platform, kBody);
     scripted->drain();
     ASSERT_TRUE(request.valueForHeader("X-Velmora-Kva-S"));
+    // What the attestation service was asked for.
+    ASSERT_EQ(scripted->calls().size(), 1u);
+    const AttestationOptions o = scripted->calls()[0];
+    EXPECT_EQ(o.keyStoreLabel, "com.velmora.qaxagent.kvaCertificates");
+    EXPECT_EQ(o.keyStoreAccessGroup, "com.velmora.qaxagent");
+    EXPECT_TRUE(o.includeCACertificate);
+    EXPECT_EQ(o.networkTimeoutInterval, 60);
+    EXPECT_FALSE(o.svxtAttestation);
+    EXPECT_EQ(o.validity, 43200);
+    ASSERT_TRUE(o.accessControls);
+    EXPECT_EQ(o.accessControls->accessibility, KeyAccessibility::AfterFirstUnlockThisDeviceOnly);
+    EXPECT_TRUE(o.accessControls->privateKeyUsageOnly);
+    EXPECT_EQ(o.oidsToInclude,
+              (std::vector<AttestationOID>{
+                  AttestationOID::UVXTDeviceIdentifiers, AttestationOID::DeviceIdentifiers,
+                  AttestationOID::HardwareProperties, AttestationOID::AccessControls,
+                  AttestationOID::DeviceOSInformation}));
     auto chain = chainFromHeader(request);
     ASSERT_EQ(chain.size(), 2u);
     ASSERT_TRUE(chain[0] && chain[1]);
@@ -200,46 +217,15 @@ TEST_F(QAXKVAManagerTest, HeadersCarryAVerifiableSignatureAndChain) {
         signatureVerifies(chain[0].get(), *again.valueForHeader("X-Velmora-Kva-S"), "other body"));
 }
 
-TEST_F(QAXKVAManagerTest, IssuanceOptions) {
-    auto manager = QAXKVAManager::create(scripted);
-    ASSERT_TRUE(manager->generateKVACertficate({}));
-    scripted->drain();
-    auto calls = scripted->calls();
-    ASSERT_EQ(calls.size(), 1u);
-    const auto& o = calls[0];
-    EXPECT_EQ(o.keyStoreLabel, "com.velmora.qaxagent.kvaCertificates");
-    EXPECT_EQ(o.keyStoreAccessGroup, "com.velmora.qaxagent");
-    EXPECT_TRUE(o.includeCACertificate);
-    EXPECT_EQ(o.networkTimeoutInterval, 60);
-    EXPECT_FALSE(o.svxtAttestation);
-    EXPECT_EQ(o.validity, 43200);
-    ASSERT_TRUE(o.accessControls);
-    EXPECT_EQ(o.accessControls->accessibility, KeyAccessibility::AfterFirstUnlockThisDeviceOnly);
-    EXPECT_TRUE(o.accessControls->privateKeyUsageOnly);
-    EXPECT_EQ(o.oidsToInclude,
-              (std::vector<AttestationOID>{
-                  AttestationOID::UVXTDeviceIdentifiers, AttestationOID::DeviceIdentifiers,
-                  AttestationOID::HardwareProperties, AttestationOID::AccessControls,
-                  AttestationOID::DeviceOSInformation}));
-}
-
 TEST_F(QAXKVAManagerTest, IssuanceOutcomes) {
-    struct Row {
-        const char* name;
-        std::vector<Step> script;
-        bool generated;
-        std::size_t issuances;
-        bool completionHasChain;
-        std::optional<long> completionError;
-        std::vector<std::string> messages;  // each must be logged
-    };
     const std::string fallback =
         "-[QAXKVAManager generateKVACertficate:]_completion: KVA (UVXT) failed due to missing "
         "UVXT with error: AttestationError(code -11): scripted failure, falling back to KVA (SVXT)";
     const std::string noChain =
         "-[QAXKVAManager generateKVACertficate:]_completion: Failed to get reference key or cert!";
     // clang-format off
-    const Row rows[] = {
+    // The script, whether a key came, the issuances, what the completion got, messages logged.
+    const std::tuple<const char*, std::vector<Step>, bool, std::size_t, bool, std::optional<long>, std::vector<std::string>> rows[] = {
         {"missing user certificate (-11) falls back", {{Step::Fail, -11}, {Step::Forward}}, true,
          2, true, std::nullopt, {fallback}},
         {"missing user certificate (-4) falls back", {{Step::Fail, -4}, {Step::Forward}}, true, 2,
@@ -252,10 +238,11 @@ TEST_F(QAXKVAManagerTest, IssuanceOutcomes) {
         {"no chain", {{Step::KeyOnly}}, false, 1, false, std::nullopt, {noChain}},
     };
     // clang-format on
-    for (const auto& row : rows) {
-        SCOPED_TRACE(row.name);
+    for (const auto& [name, script, generates, issuances, completionHasChain, completionError,
+                      messages] : rows) {
+        SCOPED_TRACE(name);
         tp.log->clear();
-        scripted->script.assign(row.script.begin(), row.script.end());
+        scripted->script.assign(script.begin(), script.end());
         std::size_t before = scripted->calls().size();
         std::atomic<int> completions{0};
         bool hadChain = false;
@@ -269,17 +256,17 @@ TEST_F(QAXKVAManagerTest, IssuanceOutcomes) {
             error = e ? std::optional<long>(e->code) : std::nullopt;
         });
         scripted->drain();
-        EXPECT_EQ(generated, row.generated);
+        EXPECT_EQ(generated, generates);
         EXPECT_EQ(completions.load(), 1) << "one completion, one signal";
-        EXPECT_EQ(hadChain, row.completionHasChain);
-        EXPECT_EQ(error, row.completionError);
+        EXPECT_EQ(hadChain, completionHasChain);
+        EXPECT_EQ(error, completionError);
         auto calls = scripted->calls();
-        ASSERT_EQ(calls.size() - before, row.issuances);
+        ASSERT_EQ(calls.size() - before, issuances);
         EXPECT_FALSE(calls[before].svxtAttestation);
-        if (row.issuances == 2) {
+        if (issuances == 2) {
             EXPECT_TRUE(calls[before + 1].svxtAttestation);
         }
-        for (const auto& m : row.messages) {
+        for (const auto& m : messages) {
             EXPECT_TRUE(tp.log->contains(m)) << m;
         }
         EXPECT_EQ(generated, manager->privateKey() != nullptr);
@@ -400,13 +387,13 @@ TEST(HostAttestationServiceTest, PlatformFileControlsSupportAndFirstIssuance) {
     const auto file = std::filesystem::path(tp.platform->platformRoot) / "attestation.plist";
     EXPECT_TRUE(service->isAttestationSupported()) << "no file: supported";
 
-    test::writeFile(file, *toXmlPlist(Value(Value::Dictionary{{"Supported", false}})));
+    test::writeFile(file, *toXmlPlist(Value::Dictionary{{"Supported", false}}));
     EXPECT_FALSE(service->isAttestationSupported());
     HttpRequest none("https://coverage.example/");
     addKVAAuthenticationHeadersWithBody(none, *tp.platform, kBody);
     EXPECT_FALSE(none.valueForHeader("X-Velmora-Kva"));
 
-    test::writeFile(file, *toXmlPlist(Value(Value::Dictionary{{"FirstIssuanceErrorCode", -11}})));
+    test::writeFile(file, *toXmlPlist(Value::Dictionary{{"FirstIssuanceErrorCode", -11}}));
     HttpRequest fallback("https://coverage.example/");
     addKVAAuthenticationHeadersWithBody(fallback, *tp.platform, kBody);
     EXPECT_TRUE(fallback.valueForHeader("X-Velmora-Kva"));
@@ -419,7 +406,7 @@ TEST(HostAttestationServiceTest, PlatformFileControlsSupportAndFirstIssuance) {
     ASSERT_TRUE(level);
     EXPECT_EQ(*level->find("level"), Value("SVXT"));
 
-    test::writeFile(file, *toXmlPlist(Value(Value::Dictionary{{"FirstIssuanceErrorCode", -2}})));
+    test::writeFile(file, *toXmlPlist(Value::Dictionary{{"FirstIssuanceErrorCode", -2}}));
     HttpRequest failed("https://coverage.example/");
     addKVAAuthenticationHeadersWithBody(failed, *tp.platform, kBody);
     EXPECT_FALSE(failed.valueForHeader("X-Velmora-Kva"));
@@ -430,12 +417,6 @@ TEST(HostAttestationServiceTest, PlatformFileControlsSupportAndFirstIssuance) {
                                  tp.clock);
     EXPECT_EQ(again.rootCertificatePEM(nullptr), first);
 }
-
-}  // namespace
-}  // namespace qax
-
-namespace qax {
-namespace {
 
 TEST(HostAttestationServiceTest, LastReferenceDroppedOnItsOwnThread) {
     test::TestPlatform tp;

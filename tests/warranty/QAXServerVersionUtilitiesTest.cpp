@@ -2,12 +2,8 @@
 
 #include <gtest/gtest.h>
 
-#include <atomic>
-#include <chrono>
-#include <future>
-#include <mutex>
-
 #include "core/PlistCodec.h"
+#include "fakes/Await.h"
 #include "fakes/TestHttpsServer.h"
 #include "fakes/TestPlatform.h"
 #include "platform/PreferenceStore.h"
@@ -17,7 +13,7 @@
 namespace qax {
 namespace {
 
-using namespace std::chrono_literals;
+using test::await;
 
 constexpr const char* kListPath = "/library/VELMORA/asset/qaxV2.plist";
 constexpr const char* kCache = "ServerVersionCache";
@@ -36,14 +32,7 @@ Value versionList(Value low, Value high) {
 class QAXServerVersionUtilitiesTest : public ::testing::Test {
   protected:
     QAXServerVersionUtilitiesTest() {
-        server.server().Get(kListPath, [this](const httplib::Request&, httplib::Response& res) {
-            std::lock_guard<std::mutex> lock(mutex_);
-            ++hits_;
-            if (!cacheControl_.empty()) {
-                res.set_header("Cache-Control", cacheControl_);
-            }
-            res.set_content(body_, "application/x-plist");
-        });
+        server.answer(kListPath, {});
         server.start();
         server.trustIn(tp.platform->platformRoot);
         tp.platform->http = std::make_shared<CurlHttpClient>(
@@ -55,28 +44,15 @@ class QAXServerVersionUtilitiesTest : public ::testing::Test {
     PreferenceStore& preferences() { return *tp.platform->preferences; }
 
     void serve(const std::string& body, const std::string& cacheControl = "") {
-        std::lock_guard<std::mutex> lock(mutex_);
-        body_ = body;
-        cacheControl_ = cacheControl;
+        httplib::Headers headers;
+        if (!cacheControl.empty()) {
+            headers.emplace("Cache-Control", cacheControl);
+        }
+        server.setAnswer(kListPath, {200, body, "application/x-plist", headers});
     }
     void serveList(const Value& list) { serve(*toXmlPlist(list)); }
-    int hits() {
-        std::lock_guard<std::mutex> lock(mutex_);
-        return hits_;
-    }
+    int hits() { return static_cast<int>(server.requests().size()); }
 
-    // Waits for a completion that may run on the HTTP session's thread.
-    template <typename T, typename Start>
-    static T await(Start start) {
-        auto promise = std::make_shared<std::promise<T>>();
-        auto future = promise->get_future();
-        start([promise](T value) { promise->set_value(std::move(value)); });
-        if (future.wait_for(20s) != std::future_status::ready) {
-            ADD_FAILURE() << "the completion was not called";
-            return T{};
-        }
-        return future.get();
-    }
     std::optional<QAXVersionSet> negotiate(QAXServerLookupPolicy policy) {
         return await<std::optional<QAXVersionSet>>([&](auto done) {
             QAXServerVersionUtilities::_supportedVersionsForClientAndServer(*tp.platform, policy,
@@ -96,65 +72,54 @@ class QAXServerVersionUtilitiesTest : public ::testing::Test {
     }
     std::optional<Value> cache() { return preferences().objectForKey(kCache); }
 
-  private:
-    // What the server serves: declared before the server so that it outlives its threads.
-    std::mutex mutex_;
-    std::string body_;
-    std::string cacheControl_;
-    int hits_ = 0;
-
-  protected:
     test::TestHttpsServer server;  // outlives the platform's HTTP session
     test::TestPlatform tp;
 };
 
 TEST_F(QAXServerVersionUtilitiesTest, OverlapOfTheEndPointsDecidesSupportAndTheHighFeatureSet) {
-    struct Case {
-        const char* name;
-        Value list;
-        std::optional<QAXVersionSet> overlap;
-        bool enabled;
-        const char* message;
-    };
     Value withExtraKey = versionList(2, 3);
     withExtraKey["MinimumClient"] = "4.0";
-    const Case cases[] = {
-        {"same pair", versionList(2, 3), QAXVersionSet{2, 3}, true,
-         "clientAndServerSet '{(2, 3)}'"},
-        {"strings", versionList("2", "2"), QAXVersionSet{2}, false, "clientAndServerSet '{(2)}'"},
-        {"end points only", versionList(1, 4), QAXVersionSet{}, false, "clientAndServerSet '{()}'"},
-        {"newer server", versionList(3, 5), QAXVersionSet{3}, true, "Server versions '{(3, 5)}'"},
-        {"other keys are kept", withExtraKey, QAXVersionSet{2, 3}, true,
-         "Client versions '{(2, 3)}'"},
-        {"no high version", Value(Value::Dictionary{{"LowServerVersion", 2}}), std::nullopt, false,
-         "Server version dictionary missing key 'HighServerVersion'"},
-        {"no low version", Value(Value::Dictionary{{"HighServerVersion", 3}}), std::nullopt, false,
-         "Server version dictionary missing key 'LowServerVersion'"},
-    };
-    for (const auto& c : cases) {
-        SCOPED_TRACE(c.name);
+    const std::tuple<const char*, Value, std::optional<QAXVersionSet>, bool, const char*> cases[] =
+        {
+            {"same pair", versionList(2, 3), QAXVersionSet{2, 3}, true,
+             "clientAndServerSet '{(2, 3)}'"},
+            {"strings", versionList("2", "2"), QAXVersionSet{2}, false,
+             "clientAndServerSet '{(2)}'"},
+            {"end points only", versionList(1, 4), QAXVersionSet{}, false,
+             "clientAndServerSet '{()}'"},
+            {"newer server", versionList(3, 5), QAXVersionSet{3}, true,
+             "Server versions '{(3, 5)}'"},
+            {"other keys are kept", withExtraKey, QAXVersionSet{2, 3}, true,
+             "Client versions '{(2, 3)}'"},
+            {"no high version", Value::Dictionary{{"LowServerVersion", 2}}, std::nullopt, false,
+             "Server version dictionary missing key 'HighServerVersion'"},
+            {"no low version", Value::Dictionary{{"HighServerVersion", 3}}, std::nullopt, false,
+             "Server version dictionary missing key 'LowServerVersion'"},
+        };
+    for (const auto& [name, list, overlap, enabled, message] : cases) {
+        SCOPED_TRACE(name);
         preferences().removeObject(kCache);
         tp.log->clear();
-        serveList(c.list);
+        serveList(list);
         const int before = hits();
 
-        EXPECT_EQ(negotiate(QAXServerLookupPolicyNetworkFirst), c.overlap);
-        EXPECT_EQ(tp.log->count(c.message), 1);
-        EXPECT_EQ(cache(), c.list);  // the fetched list, as it was
-        EXPECT_EQ(supported(), c.overlap && !c.overlap->empty());
+        EXPECT_EQ(negotiate(QAXServerLookupPolicyNetworkFirst), overlap);
+        EXPECT_EQ(tp.log->count(message), 1);
+        EXPECT_EQ(cache(), list);  // the fetched list, as it was
+        EXPECT_EQ(supported(), overlap && !overlap->empty());
         EXPECT_EQ(hits(), before + 2);
 
         // The other policies answer from the cache, without the network.
-        EXPECT_EQ(highEnabled(QAXServerLookupPolicyCacheFirst), c.enabled);
+        EXPECT_EQ(highEnabled(QAXServerLookupPolicyCacheFirst), enabled);
         EXPECT_EQ(QAXServerVersionUtilities::isHighServerVersionFeaturesetEnabled(*tp.platform),
-                  c.enabled);
+                  enabled);
         EXPECT_EQ(hits(), before + 2);
     }
 }
 
 TEST_F(QAXServerVersionUtilitiesTest, AListThatIsNotADictionaryIsFetchedOnceMoreBypassingTheCache) {
     constexpr const char* kRetrying = "Incorrect format in response detected. retrying...";
-    const std::string array = *toXmlPlist(Value(Value::Array{2, 3}));
+    const std::string array = *toXmlPlist(Value::Array{2, 3});
     const std::string abort =
         "Incorrect format in response detected from URL '" + server.url(kListPath) +
         "'. Response: " + Value(Value::Array{2, 3}).description() + ". Aborting without retry.";
@@ -219,35 +184,29 @@ TEST_F(QAXServerVersionUtilitiesTest, AnUnreachableServerFallsBackByPolicy) {
     preferences().setObject(
         settings::kServerVersionURL,
         "https://127.0.0.1:" + std::to_string(test::unusedLocalPort()) + kListPath);
-    struct Case {
-        QAXServerLookupPolicy policy;
-        std::optional<Value> cached;
-        QAXVersionSet overlap;
-        std::optional<Value> cacheAfter;
-        int fetchFailures;
-    };
-    const Case cases[] = {
-        {QAXServerLookupPolicyCacheFirst, std::nullopt, {2, 3}, std::nullopt, 1},
-        {QAXServerLookupPolicyCacheFirst, versionList(3, 5), {3}, versionList(3, 5), 0},
-        {QAXServerLookupPolicy(7), std::nullopt, {2, 3}, std::nullopt, 1},
-        {QAXServerLookupPolicyNoNetwork, std::nullopt, {2, 3}, std::nullopt, 0},
-        {QAXServerLookupPolicyNoNetwork, versionList(3, 5), {3}, versionList(3, 5), 0},
-        {QAXServerLookupPolicyNetworkFirst, std::nullopt, {2, 3}, versionList(2, 3), 1},
-        {QAXServerLookupPolicyNetworkFirst, versionList(3, 5), {3}, versionList(3, 5), 1},
-    };
-    for (const auto& c : cases) {
-        SCOPED_TRACE(testing::Message()
-                     << "policy " << c.policy << " cached " << c.cached.has_value());
+    const std::tuple<QAXServerLookupPolicy, std::optional<Value>, QAXVersionSet,
+                     std::optional<Value>, int>
+        cases[] = {
+            {QAXServerLookupPolicyCacheFirst, std::nullopt, {2, 3}, std::nullopt, 1},
+            {QAXServerLookupPolicyCacheFirst, versionList(3, 5), {3}, versionList(3, 5), 0},
+            {QAXServerLookupPolicy(7), std::nullopt, {2, 3}, std::nullopt, 1},
+            {QAXServerLookupPolicyNoNetwork, std::nullopt, {2, 3}, std::nullopt, 0},
+            {QAXServerLookupPolicyNoNetwork, versionList(3, 5), {3}, versionList(3, 5), 0},
+            {QAXServerLookupPolicyNetworkFirst, std::nullopt, {2, 3}, versionList(2, 3), 1},
+            {QAXServerLookupPolicyNetworkFirst, versionList(3, 5), {3}, versionList(3, 5), 1},
+        };
+    for (const auto& [policy, cached, overlap, cacheAfter, fetchFailures] : cases) {
+        SCOPED_TRACE(testing::Message() << "policy " << policy << " cached " << cached.has_value());
         preferences().removeObject(kCache);
-        if (c.cached) {
-            preferences().setObject(kCache, *c.cached);
+        if (cached) {
+            preferences().setObject(kCache, *cached);
         }
         tp.log->clear();
-        EXPECT_EQ(negotiate(c.policy), c.overlap);
-        EXPECT_EQ(cache(), c.cacheAfter);
-        EXPECT_EQ(tp.log->countContaining(kFetchFailed), c.fetchFailures);
+        EXPECT_EQ(negotiate(policy), overlap);
+        EXPECT_EQ(cache(), cacheAfter);
+        EXPECT_EQ(tp.log->countContaining(kFetchFailed), fetchFailures);
         EXPECT_EQ(tp.log->count(std::string(" Server lookup policy:") +
-                                std::to_string(static_cast<std::uint64_t>(c.policy))),
+                                std::to_string(static_cast<std::uint64_t>(policy))),
                   1);
     }
     // Downloads still go ahead when the list cannot be fetched.
@@ -285,25 +244,19 @@ TEST_F(QAXServerVersionUtilitiesTest, ACacheThatIsNoDictionaryIsRemovedAndIgnore
     constexpr const char* kRemoving =
         "Incorrect format stored in server version cache. Removing it.";
     serveList(versionList(3, 5));
-    struct Case {
-        QAXServerLookupPolicy policy;
-        QAXVersionSet overlap;
-        std::optional<Value> cacheAfter;
-        int hits;
-    };
-    const Case cases[] = {
+    const std::tuple<QAXServerLookupPolicy, QAXVersionSet, std::optional<Value>, int> cases[] = {
         {QAXServerLookupPolicyNoNetwork, {2, 3}, std::nullopt, 0},
         {QAXServerLookupPolicyCacheFirst, {3}, versionList(3, 5), 1},
     };
-    for (const auto& c : cases) {
-        SCOPED_TRACE(c.policy);
+    for (const auto& [policy, overlap, cacheAfter, fetches] : cases) {
+        SCOPED_TRACE(policy);
         preferences().setObject(kCache, "not a list");
         tp.log->clear();
         const int before = hits();
-        EXPECT_EQ(negotiate(c.policy), c.overlap);
+        EXPECT_EQ(negotiate(policy), overlap);
         EXPECT_EQ(tp.log->count(kRemoving), 1);
-        EXPECT_EQ(cache(), c.cacheAfter);
-        EXPECT_EQ(hits(), before + c.hits);
+        EXPECT_EQ(cache(), cacheAfter);
+        EXPECT_EQ(hits(), before + fetches);
     }
 
     // With nothing cached, the immediate form answers from the client versions and leaves

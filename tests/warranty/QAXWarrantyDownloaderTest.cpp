@@ -4,16 +4,14 @@
 
 #include <gtest/gtest.h>
 
-#include <chrono>
 #include <deque>
-#include <future>
-#include <mutex>
 #include <tuple>
 
 #include "core/AsioDispatcher.h"
 #include "core/Hash.h"
 #include "core/JsonCodec.h"
 #include "core/PlistCodec.h"
+#include "fakes/Await.h"
 #include "fakes/FakeAccounts.h"
 #include "fakes/FakeAgentFactory.h"
 #include "fakes/TestHttpsServer.h"
@@ -28,8 +26,6 @@
 namespace qax {
 namespace {
 
-using namespace std::chrono_literals;
-
 constexpr const char* kListPath = "/library/VELMORA/asset/qaxV2.plist";
 constexpr const char* kPhonePath = "/api/v3/coverage/summary";
 constexpr const char* kWearablePath = "/api/v2/coverage/summary";
@@ -38,46 +34,22 @@ constexpr const char* kFailed = "qaxagent failed to load warranty";
 constexpr const char* kCaller = "com.example.caller";
 
 Value versionList(int low, int high) {
-    return Value(Value::Dictionary{{"LowServerVersion", low}, {"HighServerVersion", high}});
+    return Value::Dictionary{{"LowServerVersion", low}, {"HighServerVersion", high}};
 }
 
 class QAXWarrantyDownloaderTest : public ::testing::Test {
   protected:
-    struct Answer {
-        int status = 200;
-        std::string body;
-    };
-    struct Received {
-        std::string path;
-        httplib::Headers headers;
-        std::string body;
-    };
+    using Answer = test::TestHttpsServer::Answer;
     struct Result {
         bool success = false;
         std::shared_ptr<QAXWarranty> warranty;
     };
 
     QAXWarrantyDownloaderTest() {
-        server.server().Get(kListPath, [this](const httplib::Request&, httplib::Response& res) {
-            std::lock_guard lock(mutex_);
-            if (listStatus_ != 200) {
-                res.status = listStatus_;
-                return;
-            }
-            res.set_content(*toXmlPlist(list_), "application/x-plist");
-        });
-        for (const char* path : {kPhonePath, kWearablePath}) {
-            server.server().Post(path, [this](const httplib::Request& req, httplib::Response& res) {
-                std::lock_guard lock(mutex_);
-                received_.push_back({req.path, req.headers, req.body});
-                Answer answer = answers_.empty() ? Answer{200, summaryText_} : answers_.front();
-                if (!answers_.empty()) {
-                    answers_.pop_front();
-                }
-                res.status = answer.status;
-                res.set_content(answer.body, "application/json");
-            });
-        }
+        server.answer(kListPath, {});
+        serveList(versionList(2, 3));
+        server.answer(kPhonePath, {200, summaryText_});
+        server.answer(kWearablePath, {200, summaryText_});
         server.start();
         server.trustIn(tp.platform->platformRoot);
 
@@ -103,33 +75,28 @@ class QAXWarrantyDownloaderTest : public ::testing::Test {
         return static_cast<test::FakeAgentFactory&>(*tp.platform->agentFactory);
     }
 
-    void script(std::deque<Answer> answers) {
-        std::lock_guard lock(mutex_);
-        answers_ = std::move(answers);
-    }
+    // The answers to this device's next summary requests.
+    void script(std::deque<Answer> answers) { server.queue(kPhonePath, std::move(answers)); }
     void serveList(Value list, int status = 200) {
-        std::lock_guard lock(mutex_);
-        list_ = std::move(list);
-        listStatus_ = status;
+        server.setAnswer(kListPath,
+                         {status, status == 200 ? *toXmlPlist(list) : "", "application/x-plist"});
     }
-    std::vector<Received> received() {
-        std::lock_guard lock(mutex_);
-        return received_;
+    // The summary requests.
+    std::vector<test::TestHttpsServer::Request> received() {
+        auto all = server.requests();
+        std::erase_if(all, [](const auto& r) { return r.method != "POST"; });
+        return all;
     }
 
     Result download(const std::string& serial) {
-        auto promise = std::make_shared<std::promise<Result>>();
-        auto future = promise->get_future();
-        QAXWarrantyDownloader::initWithCallingProcessBundleID(tp.platform, kCaller)
-            ->downloadWarrantyForSerialNumber(serial,
-                                              [promise](bool ok, std::shared_ptr<QAXWarranty> w) {
-                                                  promise->set_value({ok, std::move(w)});
-                                              });
-        if (future.wait_for(30s) != std::future_status::ready) {
-            ADD_FAILURE() << "the download did not complete";
-            return {};
-        }
-        return future.get();
+        return test::await<Result>(
+            [&](auto done) {
+                QAXWarrantyDownloader::initWithCallingProcessBundleID(tp.platform, kCaller)
+                    ->downloadWarrantyForSerialNumber(serial, [done](bool ok, auto w) {
+                        done({ok, std::move(w)});
+                    });
+            },
+            30);
     }
 
     // A cached warranty with its three keys, as an earlier download leaves them.
@@ -147,7 +114,7 @@ class QAXWarrantyDownloaderTest : public ::testing::Test {
                 prefs().objectForKey(h + "_CachedWarrantyVersion")};
     }
     CacheState seedCache(const std::string& serial) {
-        QAXWarranty::warrantyWithDictionary(tp.platform, Value(Value::Dictionary{{"old", true}}))
+        QAXWarranty::warrantyWithDictionary(tp.platform, Value::Dictionary{{"old", true}})
             ->cacheWarranty(serial);
         const std::string h = sha256Hash(serial);
         prefs().setObject(h + "_CachedWarrantyLastUpdatedDate", Value(Date(1000)));
@@ -155,14 +122,6 @@ class QAXWarrantyDownloaderTest : public ::testing::Test {
         prefs().setObject(h + "_CachedWarrantyVersion", "1");
         return cacheState(serial);
     }
-
-  private:
-    // What the server serves: declared before the server so that it outlives its threads.
-    std::mutex mutex_;
-    Value list_ = versionList(2, 3);
-    int listStatus_ = 200;
-    std::deque<Answer> answers_;
-    std::vector<Received> received_;
 
   protected:
     const Value summary{Value::Dictionary{{"covered", true}, {"coverageLocalizedLabel", "Cov"}}};
@@ -180,12 +139,7 @@ TEST_F(QAXWarrantyDownloaderTest, OnlyUnauthorizedIsRetriedAndFailuresKeepTheCac
     }
     deep += std::string(200, ']') + "}";
     const Answer unauthorized{401, "{}"};
-    struct Row {
-        const char* name;
-        std::deque<Answer> answers;
-        std::size_t attempts;
-        bool success;
-    } rows[] = {
+    const std::tuple<const char*, std::deque<Answer>, std::size_t, bool> rows[] = {
         {"401, 401, 200", {unauthorized, unauthorized, {200, summaryText_}}, 3, true},
         {"three 401s", {unauthorized, unauthorized, unauthorized, {200, summaryText_}}, 3, false},
         {"500 is not retried", {{500, summaryText_}, {200, summaryText_}}, 1, false},
@@ -194,20 +148,20 @@ TEST_F(QAXWarrantyDownloaderTest, OnlyUnauthorizedIsRetriedAndFailuresKeepTheCac
         {"nested too deep", {{200, deep}}, 1, false},
         {"200 without a body", {{200, ""}}, 1, false},
     };
-    for (auto& row : rows) {
-        SCOPED_TRACE(row.name);
+    for (const auto& [name, answers, attempts, success] : rows) {
+        SCOPED_TRACE(name);
         const CacheState before = seedCache(kThisDevice);
         const auto renewalsBefore = accounts->renewals().size();
         const auto postsBefore = received().size();
         tp.log->clear();
-        script(row.answers);
+        script(answers);
 
         Result result = download(kThisDevice);
-        EXPECT_EQ(result.success, row.success);
-        EXPECT_EQ(received().size() - postsBefore, row.attempts);
+        EXPECT_EQ(result.success, success);
+        EXPECT_EQ(received().size() - postsBefore, attempts);
         // Every attempt after the first is signed with a freshly provisioned token.
-        EXPECT_EQ(accounts->renewals().size() - renewalsBefore, row.attempts - 1);
-        if (row.success) {
+        EXPECT_EQ(accounts->renewals().size() - renewalsBefore, attempts - 1);
+        if (success) {
             ASSERT_TRUE(result.warranty);
             EXPECT_EQ(result.warranty->dictionaryRepresentation(), summary);
             const CacheState after = cacheState(kThisDevice);
@@ -240,20 +194,6 @@ TEST_F(QAXWarrantyDownloaderTest, AnUnwritableCacheLeavesTheKeysAlone) {
     const CacheState after = cacheState(kThisDevice);
     EXPECT_EQ(std::tie(after.date, after.locale, after.version),
               std::tie(before.date, before.locale, before.version));
-}
-
-TEST_F(QAXWarrantyDownloaderTest, ThisDeviceAndOtherDevicesUseTheirOwnEndpoints) {
-    ASSERT_TRUE(download(kThisDevice).success);
-    ASSERT_TRUE(download("WATCH-1").success);
-    auto got = received();
-    ASSERT_EQ(got.size(), 2u);
-    EXPECT_EQ(got[0].path, kPhonePath);
-    EXPECT_EQ(got[1].path, kWearablePath);
-    // Attestation headers go only with this device's request.
-    EXPECT_TRUE(got[0].headers.count("X-Velmora-Kva-S") && got[0].headers.count("X-Velmora-Kva"));
-    EXPECT_FALSE(got[1].headers.count("X-Velmora-Kva-S") || got[1].headers.count("X-Velmora-Kva"));
-    EXPECT_EQ(got[1].headers.find("User-Agent")->second, "<com.example.caller/4.2/Model9,1>");
-    EXPECT_EQ(*parseJson(got[1].body)->find("serialNumber"), Value("WATCH-1"));
 }
 
 TEST_F(QAXWarrantyDownloaderTest, NothingIsSentForAnUnsupportedServerOrAnUnsignedRequest) {
@@ -315,7 +255,7 @@ TEST_F(QAXWarrantyDownloaderTest, LocalFilesPreferThePerSerialFile) {
          "contains no plist data"},
         {"not a property list", base, std::nullopt, std::nullopt, "{\"json\": true}", std::nullopt,
          "Error serializing plist file from URL '" + base + "': "},
-        {"an array", base, Value(Value::Array{1, 2}), std::nullopt, "", std::nullopt, kFailed},
+        {"an array", base, Value::Array{1, 2}, std::nullopt, "", std::nullopt, kFailed},
     };
     // clang-format on
     for (const auto& row : rows) {
@@ -358,16 +298,10 @@ TEST_F(QAXWarrantyDownloaderTest, ConversionOutreachMovesOnlyEarlier) {
         return QAXWarranty::warrantyWithDictionary(tp.platform, d);
     };
     const double D = 1'800'000'000;
-    struct Row {
-        const char* name;
-        std::optional<std::optional<double>> previous;  // outer none: nothing cached
-        std::optional<double> next;
-        std::optional<double> scheduled;
-        bool schedules;
-        const char* message;
-    };
     // clang-format off
-    const Row rows[] = {
+    // The cached conversion date (outer none: nothing cached), the new one, the date scheduled
+    // before, whether the run schedules, and its message.
+    const std::tuple<const char*, std::optional<std::optional<double>>, std::optional<double>, std::optional<double>, bool, const char*> rows[] = {
         {"first date", std::nullopt, D, std::nullopt, true, "scheduling conversion outreach"},
         {"unchanged", std::optional<double>(D), D, std::nullopt, false, nullptr},
         {"previous had none", std::optional<double>(), D, std::nullopt, false, nullptr},
@@ -378,10 +312,10 @@ TEST_F(QAXWarrantyDownloaderTest, ConversionOutreachMovesOnlyEarlier) {
          "Re-scheduling conversion outreach"},
     };
     // clang-format on
-    for (const auto& row : rows) {
-        SCOPED_TRACE(row.name);
-        if (row.scheduled) {
-            prefs().setObject(kScheduledKey, Value(Date(*row.scheduled)));
+    for (const auto& [name, previous, next, scheduled, schedules, message] : rows) {
+        SCOPED_TRACE(name);
+        if (scheduled) {
+            prefs().setObject(kScheduledKey, Value(Date(*scheduled)));
         } else {
             prefs().removeObject(kScheduledKey);
         }
@@ -390,18 +324,18 @@ TEST_F(QAXWarrantyDownloaderTest, ConversionOutreachMovesOnlyEarlier) {
         auto downloader =
             QAXWarrantyDownloader::initWithCallingProcessBundleID(tp.platform, kCaller);
         downloader->_scheduleConversionOutreachIfRequiredForWarranty(
-            record(row.next), row.previous ? record(*row.previous) : nullptr);
+            record(next), previous ? record(*previous) : nullptr);
 
         auto schedulings = factory().schedulings();
-        ASSERT_EQ(schedulings.size() - before, row.schedules ? 1u : 0u);
-        if (row.schedules) {
+        ASSERT_EQ(schedulings.size() - before, schedules ? 1u : 0u);
+        if (schedules) {
             EXPECT_EQ(schedulings.back().identifier, kQAXConversionOutreachActivityIdentifier);
             EXPECT_EQ(schedulings.back().date, Date(D));
             EXPECT_EQ(prefs().dateForKey(kScheduledKey), Date(D));
-            EXPECT_EQ(tp.log->count(std::string(row.message) + " " + Date(D).description()), 1);
+            EXPECT_EQ(tp.log->count(std::string(message) + " " + Date(D).description()), 1);
         } else {
             EXPECT_EQ(prefs().dateForKey(kScheduledKey),
-                      row.scheduled ? std::optional<Date>(Date(*row.scheduled)) : std::nullopt);
+                      scheduled ? std::optional<Date>(Date(*scheduled)) : std::nullopt);
         }
     }
 }

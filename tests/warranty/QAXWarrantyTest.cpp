@@ -42,11 +42,7 @@ std::string iso(const std::optional<Date>& d) {
 }
 
 TEST_F(QAXWarrantyTest, EpochNumbersAreSecondsUpToTenBillionAndMillisecondsAbove) {
-    struct Case {
-        const char* json;  // the value of "coverageEndDate"
-        const char* expected;
-    };
-    const Case cases[] = {
+    const std::pair<const char*, const char*> cases[] = {
         {"1700000000", "2023-11-14T22:13:20.000Z"},
         {"1700000000000", "2023-11-14T22:13:20.000Z"},
         {"1700000000.9", "2023-11-14T22:13:20.000Z"},
@@ -59,28 +55,21 @@ TEST_F(QAXWarrantyTest, EpochNumbersAreSecondsUpToTenBillionAndMillisecondsAbove
         {"[1700000000]", "none"},
         {"null", "none"},
     };
-    for (const auto& c : cases) {
-        SCOPED_TRACE(c.json);
-        auto w = fromJson(std::string("{\"coverageEndDate\": ") + c.json + "}");
+    for (const auto& [json, expected] : cases) {
+        SCOPED_TRACE(json);
+        auto w = fromJson(std::string("{\"coverageEndDate\": ") + json + "}");
         ASSERT_TRUE(w);
-        EXPECT_EQ(iso(w->coverageEndDate()), c.expected);
-        EXPECT_EQ(iso(QAXWarranty::_dateWithEpochNumber(parseJson(c.json))), c.expected);
+        EXPECT_EQ(iso(w->coverageEndDate()), expected);
+        EXPECT_EQ(iso(QAXWarranty::_dateWithEpochNumber(parseJson(json))), expected);
     }
     EXPECT_EQ(iso(fromJson("{}")->coverageEndDate()), "none");
     EXPECT_EQ(iso(QAXWarranty::_dateWithEpochNumber(nullptr)), "none");
 }
 
 TEST_F(QAXWarrantyTest, ConversionDateComesFromTheSettingThenTheSummaryThenTheEndDate) {
-    struct Case {
-        const char* name;
-        const char* summary;
-        std::optional<Value> conversionSetting;
-        std::optional<Value> oneDayInterval;
-        std::optional<double> expected;
-    };
     const char* kEnd = R"({"coverageEndDate": 1700000000})";
     // clang-format off
-    const Case cases[] = {
+    const std::tuple<const char*, const char*, std::optional<Value>, std::optional<Value>, std::optional<double>> cases[] = {
         {"absent: end date plus a day", kEnd, {}, {}, kNow + kDay},
         {"absent: end date plus the day length as stored", kEnd, {}, Value(3600), kNow + 3600},
         {"absent without an end date", R"({})", {}, {}, {}},
@@ -98,20 +87,20 @@ TEST_F(QAXWarrantyTest, ConversionDateComesFromTheSettingThenTheSummaryThenTheEn
          Value("1800000000"), {}, 1700500000},
     };
     // clang-format on
-    for (const auto& c : cases) {
-        SCOPED_TRACE(c.name);
+    for (const auto& [name, summary, conversionSetting, oneDayInterval, expected] : cases) {
+        SCOPED_TRACE(name);
         preferences().removeObject("ConversionDate");
         preferences().removeObject(settings::kOneDayInterval);
-        if (c.conversionSetting) {
-            preferences().setObject("ConversionDate", *c.conversionSetting);
+        if (conversionSetting) {
+            preferences().setObject("ConversionDate", *conversionSetting);
         }
-        if (c.oneDayInterval) {
-            preferences().setObject(settings::kOneDayInterval, *c.oneDayInterval);
+        if (oneDayInterval) {
+            preferences().setObject(settings::kOneDayInterval, *oneDayInterval);
         }
-        auto w = fromJson(c.summary);
+        auto w = fromJson(summary);
         ASSERT_TRUE(w);
         EXPECT_EQ(iso(w->hvOfferConversionDate()),
-                  iso(c.expected ? std::optional<Date>(Date(*c.expected)) : std::nullopt));
+                  iso(expected ? std::optional<Date>(Date(*expected)) : std::nullopt));
     }
 }
 
@@ -214,70 +203,45 @@ TEST_F(QAXWarrantyTest, EachOfferTextUsesItsOwnFieldsAndRefusesANonStringFormat)
     }
 }
 
+// A field read as is from the key of its own name, or from the containers and key given.
+// clang-format off
+#define FIELD(getter) {{#getter}, [](auto& w) { return w.getter(); }}
+#define FIELD_AT(getter, ...) {{__VA_ARGS__}, [](auto& w) { return w.getter(); }}
+// clang-format on
+
 TEST_F(QAXWarrantyTest, FieldsAreReadFromTheirContainersAndKeys) {
-    using Getter = std::function<std::optional<Value>(const QAXWarranty&)>;
     struct Field {
         std::vector<std::string> path;  // containers, then the key
-        Getter get;
+        std::function<std::optional<Value>(const QAXWarranty&)> get;
     };
+    // clang-format off
     const std::vector<Field> fields = {
-        {{"localizedCoveredDeviceDateLabelFormat"},
-         [](auto& w) { return w.localizedCoveredDeviceDateLabelFormat(); }},
-        {{"coverageLocalizedLabel"}, [](auto& w) { return w.coverageLocalizedLabel(); }},
-        {{"coverageLocalizedDesc"}, [](auto& w) { return w.coverageLocalizedDesc(); }},
-        {{"coverageLocalizedDescLong"}, [](auto& w) { return w.coverageLocalizedDescLong(); }},
-        {{"coverageLocalizedExpirationLabel"},
-         [](auto& w) { return w.coverageLocalizedExpirationLabel(); }},
-        {{"footer1FormatString"}, [](auto& w) { return w.footer1FormatString(); }},
-        {{"footer1LinkLabel"}, [](auto& w) { return w.footer1LinkLabel(); }},
-        {{"footer1LinkURL"}, [](auto& w) { return w.footer1LinkURL(); }},
-        {{"footer2FormatString"}, [](auto& w) { return w.footer2FormatString(); }},
-        {{"footer2LinkLabel"}, [](auto& w) { return w.footer2LinkLabel(); }},
-        {{"footer2LinkURL"}, [](auto& w) { return w.footer2LinkURL(); }},
-        {{"hvOfferIdentifier"}, [](auto& w) { return w.hvOfferIdentifier(); }},
-        {{"hvLocalizedOfferLabel"}, [](auto& w) { return w.hvLocalizedOfferLabel(); }},
-        {{"hvLocalizedOfferPluralDescFormat"},
-         [](auto& w) { return w.hvLocalizedOfferPluralDescFormat(); }},
-        {{"hvLocalizedOfferSingularDesc"},
-         [](auto& w) { return w.hvLocalizedOfferSingularDesc(); }},
-        {{"hvNotificationLocalizedOfferLabel"},
-         [](auto& w) { return w.hvNotificationLocalizedOfferLabel(); }},
-        {{"hvNotificationLocalizedOfferSingularDesc"},
-         [](auto& w) { return w.hvNotificationLocalizedOfferSingularDesc(); }},
-        {{"hvNotificationLocalizedOfferPluralDescFormat"},
-         [](auto& w) { return w.hvNotificationLocalizedOfferPluralDescFormat(); }},
-        {{"hvLocalizedOfferCTA"}, [](auto& w) { return w.hvLocalizedOfferCTA(); }},
-        {{"hvLocalizedOfferDetails"}, [](auto& w) { return w.hvLocalizedOfferDetails(); }},
-        {{"hvLocalizedOfferDetailsPluralEligibilityFormat"},
-         [](auto& w) { return w.hvLocalizedOfferDetailsPluralEligibilityFormat(); }},
-        {{"hvLocalizedOfferDetailsSingularEligibility"},
-         [](auto& w) { return w.hvLocalizedOfferDetailsSingularEligibility(); }},
-        {{"featureToggleParameters", "hvOfferToggle"}, [](auto& w) { return w.hvOfferToggle(); }},
-        {{"hvOfferPromoFormat"}, [](auto& w) { return w.hvOfferPromoFormat(); }},
-        {{"hvOfferPromoNew"}, [](auto& w) { return w.hvOfferPromoNew(); }},
-        {{"hvServicesPartner"},
-         [](auto& w) { return w.localizedCoverageSubTitleForServicesPartnerString(); }},
-        {{"coverage", "localizedCoverageFooterFormatString"},
-         [](auto& w) { return w.localizedCoverageFooterFormatString(); }},
-        {{"coverage", "localizedCoverageFooterLinkLabel"},
-         [](auto& w) { return w.localizedCoverageFooterLinkLabel(); }},
-        {{"localizedSupportAppLabel"}, [](auto& w) { return w.localizedSupportAppLabel(); }},
-        {{"localizedSupportAppFooter"}, [](auto& w) { return w.localizedSupportAppFooter(); }},
-        {{"localizedManagePlanLabel"}, [](auto& w) { return w.localizedManagePlanLabel(); }},
-        {{"coverage", "localizedCoverageTitle"},
-         [](auto& w) { return w.localizedCoverageDetailsTitle(); }},
-        {{"coverage", "coverageDetails"}, [](auto& w) { return w.coverageDetailsArray(); }},
-        {{"coverage", "benefitsCard", "localizedBenefitsCardTitle"},
-         [](auto& w) { return w.localizedBenefitsCardTitle(); }},
-        {{"coverage", "benefitsCard", "localizedBenefitsCardSubTitle"},
-         [](auto& w) { return w.localizedBenefitsCardSubTitle(); }},
-        {{"coverage", "benefitsCard", "benefitDetails"},
-         [](auto& w) { return w.benefitDetailsArray(); }},
-        {{"coverage", "benefitsCard", "localizedBenefitsCardFooter"},
-         [](auto& w) { return w.localizedBenefitsCardFooter(); }},
-        {{"agsURL"}, [](auto& w) { return w.agsURL(); }},
-        {{"supportAppURL"}, [](auto& w) { return w.supportAppURL(); }},
-    };
+        FIELD(localizedCoveredDeviceDateLabelFormat), FIELD(coverageLocalizedLabel),
+        FIELD(coverageLocalizedDesc), FIELD(coverageLocalizedDescLong),
+        FIELD(coverageLocalizedExpirationLabel), FIELD(footer1FormatString),
+        FIELD(footer1LinkLabel), FIELD(footer1LinkURL), FIELD(footer2FormatString),
+        FIELD(footer2LinkLabel), FIELD(footer2LinkURL), FIELD(hvOfferIdentifier),
+        FIELD(hvLocalizedOfferLabel), FIELD(hvLocalizedOfferPluralDescFormat),
+        FIELD(hvLocalizedOfferSingularDesc), FIELD(hvNotificationLocalizedOfferLabel),
+        FIELD(hvNotificationLocalizedOfferSingularDesc),
+        FIELD(hvNotificationLocalizedOfferPluralDescFormat), FIELD(hvLocalizedOfferCTA),
+        FIELD(hvLocalizedOfferDetails), FIELD(hvLocalizedOfferDetailsPluralEligibilityFormat),
+        FIELD(hvLocalizedOfferDetailsSingularEligibility),
+        FIELD_AT(hvOfferToggle, "featureToggleParameters", "hvOfferToggle"),
+        FIELD(hvOfferPromoFormat), FIELD(hvOfferPromoNew),
+        FIELD_AT(localizedCoverageSubTitleForServicesPartnerString, "hvServicesPartner"),
+        FIELD_AT(localizedCoverageFooterFormatString, "coverage", "localizedCoverageFooterFormatString"),
+        FIELD_AT(localizedCoverageFooterLinkLabel, "coverage", "localizedCoverageFooterLinkLabel"),
+        FIELD(localizedSupportAppLabel), FIELD(localizedSupportAppFooter),
+        FIELD(localizedManagePlanLabel),
+        FIELD_AT(localizedCoverageDetailsTitle, "coverage", "localizedCoverageTitle"),
+        FIELD_AT(coverageDetailsArray, "coverage", "coverageDetails"),
+        FIELD_AT(localizedBenefitsCardTitle, "coverage", "benefitsCard", "localizedBenefitsCardTitle"),
+        FIELD_AT(localizedBenefitsCardSubTitle, "coverage", "benefitsCard", "localizedBenefitsCardSubTitle"),
+        FIELD_AT(benefitDetailsArray, "coverage", "benefitsCard", "benefitDetails"),
+        FIELD_AT(localizedBenefitsCardFooter, "coverage", "benefitsCard", "localizedBenefitsCardFooter"),
+        FIELD(agsURL), FIELD(supportAppURL)};
+    // clang-format on
     // Each "as is" field gets a value of its own (some of another kind than a string), so
     // a field read from the wrong key or container shows.
     Value summary{Value::Dictionary{}};
@@ -294,26 +258,23 @@ TEST_F(QAXWarrantyTest, FieldsAreReadFromTheirContainersAndKeys) {
     for (std::size_t i = 0; i < fields.size(); ++i) {
         place(fields[i].path, valueFor(i, fields[i].path.back()));
     }
-    // Flags, durations and dates, each in its own container.
-    place({"covered"}, true);
-    place({"hvOfferEligible"}, 1);
-    place({"featureToggleParameters", "hvOfferDisplay"}, true);
-    place({"featureToggleParameters", "hvOfferSettingsAppBadge"}, true);
-    place({"featureToggleParameters", "hvOfferSettingsRowBadge"}, 2.5);
-    place({"featureToggleParameters", "hvOfferDurationDaysBeforeEndDate"}, 45);
-    place({"hvOfferBadgeBeforeEndDate"}, 7);
-    place({"hvLogoToggle"}, true);
-    place({"isHvSubscription"}, true);
-    place({"isHvServicesPartner"}, true);
-    place({"displayRepairAndSupport"}, true);
-    place({"showNotificationToggle"}, true);
-    place({"showNotificationBeforeEndDate"}, 1.5);
-    place({"hvOfferFollowupDisplayDate"}, 1700100000);
-    place({"hvOfferDisplayDate"}, 1700200000000LL);
-    // Keys of fields that are never filled.
-    place({"coverageValidityDate"}, 1700000000);
-    place({"localizedCoverageDetailsLabel"}, "label");
-    place({"serialNumber"}, "C02SERIAL");
+    // Flags, durations and dates, each in its own container; then keys of fields that are
+    // never filled.
+    const std::string toggles = "featureToggleParameters";
+    // clang-format off
+    const std::pair<std::vector<std::string>, Value> others[] = {
+        {{"covered"}, true}, {{"hvOfferEligible"}, 1}, {{toggles, "hvOfferDisplay"}, true},
+        {{toggles, "hvOfferSettingsAppBadge"}, true}, {{toggles, "hvOfferSettingsRowBadge"}, 2.5},
+        {{toggles, "hvOfferDurationDaysBeforeEndDate"}, 45}, {{"hvOfferBadgeBeforeEndDate"}, 7},
+        {{"hvLogoToggle"}, true}, {{"isHvSubscription"}, true}, {{"isHvServicesPartner"}, true},
+        {{"displayRepairAndSupport"}, true}, {{"showNotificationToggle"}, true},
+        {{"showNotificationBeforeEndDate"}, 1.5}, {{"hvOfferFollowupDisplayDate"}, 1700100000},
+        {{"hvOfferDisplayDate"}, 1700200000000LL}, {{"coverageValidityDate"}, 1700000000},
+        {{"localizedCoverageDetailsLabel"}, "label"}, {{"serialNumber"}, "C02SERIAL"}};
+    // clang-format on
+    for (const auto& [path, value] : others) {
+        place(path, value);
+    }
 
     auto w = QAXWarranty::warrantyWithDictionary(tp.platform, summary, std::string("C02SERIAL"));
     ASSERT_TRUE(w);
@@ -353,6 +314,7 @@ TEST_F(QAXWarrantyTest, FieldsAreReadFromTheirContainersAndKeys) {
         "featureToggleParameters": {"showNotificationToggle": true, "hvOfferBadgeBeforeEndDate": 3},
         "coverage": ["localizedCoverageTitle"], "hvOfferDurationDaysBeforeEndDate": 9})");
     ASSERT_TRUE(misplaced);
+    EXPECT_FALSE(misplaced->covered());
     EXPECT_FALSE(misplaced->hvOfferDisplay());
     EXPECT_FALSE(misplaced->showNotificationToggle());
     EXPECT_EQ(misplaced->hvOfferBadgeDurationBeforeEndDate(), 0);
@@ -361,20 +323,8 @@ TEST_F(QAXWarrantyTest, FieldsAreReadFromTheirContainersAndKeys) {
     EXPECT_EQ(misplaced->coverageDetailsDictionary(), parseJson(R"(["localizedCoverageTitle"])"));
     EXPECT_FALSE(misplaced->coverageBenefitsDictionary());
 }
-
-TEST_F(QAXWarrantyTest, ARecordIsMadeFromAnyDictionaryAndFromNothingElse) {
-    EXPECT_FALSE(QAXWarranty::warrantyWithDictionary(tp.platform, std::nullopt));
-    EXPECT_FALSE(QAXWarranty::warrantyWithDictionary(tp.platform, parseJson("[1, 2]")));
-
-    auto empty = QAXWarranty::warrantyWithDictionary(tp.platform, Value(Value::Dictionary{}));
-    ASSERT_TRUE(empty);
-    EXPECT_FALSE(empty->covered());
-    EXPECT_EQ(empty->hvOfferDurationBeforeEndDate(), 0);
-    EXPECT_FALSE(empty->hvOfferEligibleUntil());
-    EXPECT_FALSE(empty->hvOfferConversionDate());
-    EXPECT_EQ(empty->daysEligible(), 0u);
-    EXPECT_FALSE(empty->hvLocalizedOfferDesc());  // no singular text either
-}
+#undef FIELD
+#undef FIELD_AT
 
 TEST_F(QAXWarrantyTest, JsonAndPropertyListSummariesMakeEqualRecordsThatPrintTheirDictionary) {
     const char* json = R"({"covered": true, "hvOfferEligibleUntil": 1700500000000,
@@ -398,6 +348,9 @@ TEST_F(QAXWarrantyTest, JsonAndPropertyListSummariesMakeEqualRecordsThatPrintThe
     EXPECT_FALSE(fromPlist->isEqual(other.get()));
     EXPECT_FALSE(fromPlist->isEqual(nullptr));
     EXPECT_TRUE(other->isEqual(other.get()));
+    // Anything but a dictionary makes no record.
+    EXPECT_FALSE(QAXWarranty::warrantyWithDictionary(tp.platform, std::nullopt));
+    EXPECT_FALSE(QAXWarranty::warrantyWithDictionary(tp.platform, parseJson("[1, 2]")));
 }
 
 TEST_F(QAXWarrantyTest, ArchivesRoundTripAndRefuseWhatMayNotCrossIPC) {
@@ -431,11 +384,7 @@ TEST_F(QAXWarrantyTest, ArchivesRoundTripAndRefuseWhatMayNotCrossIPC) {
     withData["coverage"]["coverageDetails"].asArray()->at(0)["blob"] = Value::Data{1, 2, 3};
     Value withNull = summary;
     withNull["coverage"]["benefitsCard"] = *parseJson(R"({"title": null})");
-    struct Refused {
-        const char* name;
-        Value archive;
-    };
-    const Refused refused[] = {
+    const std::pair<const char*, Value> refused[] = {
         {"no summary", archive(Value("QAXWarranty"), std::nullopt)},
         {"a summary that is an array", archive(Value("QAXWarranty"), *parseJson("[{}]"))},
         {"a summary that is a string", archive(Value("QAXWarranty"), Value("{}"))},
@@ -445,9 +394,9 @@ TEST_F(QAXWarrantyTest, ArchivesRoundTripAndRefuseWhatMayNotCrossIPC) {
         {"a null deep inside", archive(Value("QAXWarranty"), withNull)},
         {"not a dictionary", Value("QAXWarranty")},
     };
-    for (const auto& r : refused) {
-        SCOPED_TRACE(r.name);
-        EXPECT_FALSE(QAXWarranty::decode(tp.platform, r.archive));
+    for (const auto& [name, bad] : refused) {
+        SCOPED_TRACE(name);
+        EXPECT_FALSE(QAXWarranty::decode(tp.platform, bad));
     }
 }
 
