@@ -111,18 +111,20 @@ std::string resolvePrivateText(std::string message, bool showPrivate) {
     if (begin == std::string::npos) {
         return message;
     }
-    // Copied in runs between marks.
-    static constexpr char kMarks[] = {kPrivateBegin, kPrivateEnd, '\0'};
+    // Copied in runs between marks (find_first_of would call memchr once per character).
     std::string out(message, 0, begin);
     int depth = 0;
     std::size_t at = begin;
     while (at < message.size()) {
-        const std::size_t mark = message.find_first_of(kMarks, at);
-        const std::size_t end = mark == std::string::npos ? message.size() : mark;
-        if (depth == 0 || showPrivate) {
-            out.append(message, at, end - at);
+        std::size_t mark = at;
+        while (mark < message.size() && message[mark] != kPrivateBegin &&
+               message[mark] != kPrivateEnd) {
+            ++mark;
         }
-        if (mark == std::string::npos) {
+        if (depth == 0 || showPrivate) {
+            out.append(message, at, mark - at);
+        }
+        if (mark == message.size()) {
             break;
         }
         if (message[mark] == kPrivateBegin) {

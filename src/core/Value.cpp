@@ -171,11 +171,16 @@ void appendQuoted(std::string& out, const std::string& s) {
         return;
     }
     out += '"';
-    // Copied in runs between the characters that need an escape.
+    // Copied in runs between the characters that need an escape (find_first_of would call
+    // memchr once per character).
     std::size_t at = 0;
     while (at < s.size()) {
-        const std::size_t special = s.find_first_of("\"\\\n", at);
-        if (special == std::string::npos) {
+        std::size_t special = at;
+        while (special < s.size() && s[special] != '"' && s[special] != '\\' &&
+               s[special] != '\n') {
+            ++special;
+        }
+        if (special == s.size()) {
             out.append(s, at);
             break;
         }
