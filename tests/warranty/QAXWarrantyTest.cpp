@@ -307,6 +307,12 @@ TEST_F(QAXWarrantyTest, FieldsAreReadFromTheirContainersAndKeys) {
     EXPECT_FALSE(w->localizedBenefitLabelKey());
     EXPECT_FALSE(w->localizedBenefitValueKey());
     EXPECT_FALSE(w->serialNumber());
+    // A setter replaces what was read from the dictionary, which stays as it was.
+    w->setCoverageDetailsDictionary(Value("replaced"));
+    w->setFooter1LinkURL(std::nullopt);
+    EXPECT_EQ(w->coverageDetailsDictionary(), Value("replaced"));
+    EXPECT_FALSE(w->footer1LinkURL());
+    EXPECT_EQ(w->dictionaryRepresentation(), summary);
 
     // Keys in the wrong container do not count, and a container of the wrong kind hides its
     // fields.
